@@ -1,0 +1,29 @@
+#pragma once
+
+#include <QList>
+#include <QMap>
+#include <QString>
+#include <QVariant>
+
+// Writes the XML commands sent to the management server: no XML declaration, no white space
+// between elements. Holds no state; any number of calls may run at once.
+class MessageComposer
+{
+public:
+    virtual ~MessageComposer() = default;
+
+    // "QryAlarmList": trigger events, state filter, name rules and the UTC time bound of the
+    // request map in args; newest first, at most 5000 records.
+    virtual QString composeQueryAlarmListMessage(const QVariant& args);
+    // "ProcessAlarm": sets state and note of the listed alarms.
+    virtual QString composeProcessAlarmMessage(const QList<QString>& ids,
+                                               const QMap<QString, QVariant>& status,
+                                               const QString& note);
+    // "GetAlarmInfo": one alarm with its change log.
+    virtual QString composeGetAlarmInfoMessage(const QString& alarmId);
+    // "MuteAlarm": mutes (or unmutes) the listed alarms for interval seconds.
+    virtual QString composeMuteAlarmMessage(const QList<QString>& ids, bool mute, int interval);
+
+    // The system time zone's offset from UTC, "+HH:MM" or "-HH:MM".
+    QString getSystemTimeZone();
+};
