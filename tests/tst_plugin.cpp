@@ -20,7 +20,7 @@ namespace {
 const QString pluginId = QStringLiteral("C758778662E44060AC6E2EC5C9AD349B");
 Qt::HANDLE const clientHandle = reinterpret_cast<Qt::HANDLE>(0xC11E);
 
-RequestSenderInfo sender()
+RequestSenderInfo senderInfo()
 {
     RequestSenderInfo info;
     info.clientHandle = clientHandle;
@@ -41,13 +41,13 @@ struct Fixture
 
     void request(const QString& method, const QVariantMap& args)
     {
-        plugin->Request(method, args, sender(), host.answerSink());
+        plugin->Request(method, args, senderInfo(), host.answerSink());
     }
 
     void subscribe(const QString& key)
     {
         UntouchedResponser responser;
-        plugin->SubscribeEventBlock(key, EVENT_ALARM_UPDATED, QVariant(), sender(), responser);
+        plugin->SubscribeEventBlock(key, EVENT_ALARM_UPDATED, QVariant(), senderInfo(), responser);
         QCOMPARE(responser.calls, 0);
     }
 
@@ -58,9 +58,9 @@ struct Fixture
     }
 };
 
-const QString processReply = QStringLiteral(
-    "<ProcessAlarmRes><Result><AlarmID>A1</AlarmID><Code>0</Code></Result>"
-    "<Result><AlarmID>A2</AlarmID><Code>1</Code></Result></ProcessAlarmRes>");
+const QString processReply =
+    QStringLiteral("<ProcessAlarmRes><Result><AlarmID>A1</AlarmID><Code>0</Code></Result>"
+                   "<Result><AlarmID>A2</AlarmID><Code>1</Code></Result></ProcessAlarmRes>");
 
 } // namespace
 
@@ -73,12 +73,18 @@ private slots:
     {
         QTest::addColumn<QString>("method");
         QTest::addColumn<QString>("command"); // empty: nothing is sent
-        QTest::newRow("QryUnhandledAlarm") << "QryUnhandledAlarm" << "QryAlarmList";
-        QTest::newRow("QryAlarmList") << "QryAlarmList" << "QryAlarmList";
-        QTest::newRow("GetAlarmHistory") << "GetAlarmHistory" << "GetAlarmInfo";
-        QTest::newRow("GetAlarmHistoryForExport") << "GetAlarmHistoryForExport" << "GetAlarmInfo";
-        QTest::newRow("UpdateAlarm") << "UpdateAlarm" << "ProcessAlarm";
-        QTest::newRow("MuteAlarm") << "MuteAlarm" << "MuteAlarm";
+        QTest::newRow("QryUnhandledAlarm") << "QryUnhandledAlarm"
+                                           << "QryAlarmList";
+        QTest::newRow("QryAlarmList") << "QryAlarmList"
+                                      << "QryAlarmList";
+        QTest::newRow("GetAlarmHistory") << "GetAlarmHistory"
+                                         << "GetAlarmInfo";
+        QTest::newRow("GetAlarmHistoryForExport") << "GetAlarmHistoryForExport"
+                                                  << "GetAlarmInfo";
+        QTest::newRow("UpdateAlarm") << "UpdateAlarm"
+                                     << "ProcessAlarm";
+        QTest::newRow("MuteAlarm") << "MuteAlarm"
+                                   << "MuteAlarm";
         QTest::newRow("lower case") << "qryalarmlist" << QString();
         QTest::newRow("ProcessAlarm") << "ProcessAlarm" << QString();
         QTest::newRow("GetAlarmInfo") << "GetAlarmInfo" << QString();
@@ -107,8 +113,10 @@ private slots:
     {
         QTest::addColumn<QString>("first");
         QTest::addColumn<QString>("second");
-        QTest::newRow("queries") << "QryUnhandledAlarm" << "QryAlarmList";
-        QTest::newRow("history") << "GetAlarmHistory" << "GetAlarmHistoryForExport";
+        QTest::newRow("queries") << "QryUnhandledAlarm"
+                                 << "QryAlarmList";
+        QTest::newRow("history") << "GetAlarmHistory"
+                                 << "GetAlarmHistoryForExport";
     }
 
     void methodPairsSendTheSameCommand()
@@ -244,7 +252,8 @@ private slots:
             {"alarmUpdatedResults",
              QVariantList{
                  QVariantMap{{"alarmId", "A1"}, {"alarmStatus", "Handled"}, {"updateResult", "0"}},
-                 QVariantMap{{"alarmId", "A2"}, {"alarmStatus", "Handled"}, {"updateResult", "1"}}}},
+                 QVariantMap{
+                     {"alarmId", "A2"}, {"alarmStatus", "Handled"}, {"updateResult", "1"}}}},
             {"relayPath", "relay/request"}};
         const QList<FakeHost::Event> events = f.host.events();
         QCOMPARE(events.size(), 2);
@@ -281,8 +290,8 @@ private slots:
         const FakeHost::Answer answer = f.host.answers().first();
         QCOMPARE(answer.isLast, false);
         QCOMPARE(answer.resultCode, QStringLiteral("-1"));
-        QCOMPARE(answer.result.toMap(), (QVariantMap{{"alarmIdList", QStringList{"A1"}},
-                                                     {"relayPath", "relay/request"}}));
+        QCOMPARE(answer.result.toMap(),
+                 (QVariantMap{{"alarmIdList", QStringList{"A1"}}, {"relayPath", "relay/request"}}));
     }
 
     void historyAnswers()
@@ -399,7 +408,7 @@ private slots:
         plugin.setORVOSrvTunnelCtrl(QSharedPointer<ORVOSrvTunnelControl>::create(&own));
         QVERIFY(plugin.InitialPluginBase(&host));
         QCOMPARE(host.tunnelClientAsked, 0);
-        plugin.Request(METHOD_GET_ALARM_HISTORY, QVariantMap(), sender(), host.answerSink());
+        plugin.Request(METHOD_GET_ALARM_HISTORY, QVariantMap(), senderInfo(), host.answerSink());
         QCOMPARE(own.records().size(), 1);
         QVERIFY(host.tunnel.records().isEmpty());
 
@@ -408,7 +417,7 @@ private slots:
         QVERIFY(plugin.InitialPluginBase(&second));
         QCOMPARE(second.tunnelClientAsked, 0);
         UntouchedResponser responser;
-        plugin.SubscribeEventBlock("k", QString(), QVariant(), sender(), responser);
+        plugin.SubscribeEventBlock("k", QString(), QVariant(), senderInfo(), responser);
         plugin.emitEventSignal("E", 1);
         QVERIFY(host.events().isEmpty());
         QCOMPARE(second.events().size(), 1);
@@ -418,7 +427,7 @@ private slots:
     {
         Fixture f;
         UntouchedResponser responser;
-        f.plugin->RequestBlock(METHOD_QUERY_ALARM_LIST, QVariantMap(), sender(), responser);
+        f.plugin->RequestBlock(METHOD_QUERY_ALARM_LIST, QVariantMap(), senderInfo(), responser);
         QCOMPARE(responser.calls, 0);
         QVERIFY(f.host.tunnel.records().isEmpty());
     }
@@ -455,8 +464,7 @@ private slots:
                  QByteArray("handleQueryAlarm(Qt::HANDLE,QVariant,HDLR_DO_REQUEST_CB)"));
         QCOMPARE(method.methodType(), QMetaMethod::Method);
         QCOMPARE(method.access(), QMetaMethod::Public);
-        QCOMPARE(method.parameterNames(),
-                 (QList<QByteArray>{"clientID", "reqData", "reqCB"}));
+        QCOMPARE(method.parameterNames(), (QList<QByteArray>{"clientID", "reqData", "reqCB"}));
 
         QCOMPARE(qobject_cast<IPluginObjectBase*>(&plugin), &plugin);
         QCOMPARE(plugin.qt_metacast("PluginAlarmSearchSrv"), static_cast<void*>(&plugin));
@@ -469,11 +477,10 @@ private slots:
     {
         Fixture f;
         const HDLR_DO_REQUEST_CB callback = f.host.answerSink();
-        QVERIFY(QMetaObject::invokeMethod(
-            f.plugin.get(), "handleQueryAlarm", Qt::DirectConnection,
-            Q_ARG(Qt::HANDLE, clientHandle),
-            Q_ARG(QVariant, QVariantMap{{ARG_RELAY_PATH, "relay/m"}}),
-            Q_ARG(HDLR_DO_REQUEST_CB, callback)));
+        const QVariant args = QVariantMap{{ARG_RELAY_PATH, "relay/m"}};
+        QVERIFY(QMetaObject::invokeMethod(f.plugin.get(), "handleQueryAlarm", Qt::DirectConnection,
+                                          Q_ARG(Qt::HANDLE, clientHandle), Q_ARG(QVariant, args),
+                                          Q_ARG(HDLR_DO_REQUEST_CB, callback)));
         QCOMPARE(f.host.tunnel.last().relayPath, QStringLiteral("relay/m"));
         QCOMPARE(f.host.tunnel.last().clientID, clientHandle);
     }

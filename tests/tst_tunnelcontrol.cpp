@@ -24,10 +24,9 @@ struct Outcome
 
 ORVOSrvTunnelControl::QueryAlarmCompletion recordQuery(Outcome& out)
 {
-    return [&out](bool ok, bool isLast, const QVariant& result, const QString& status,
-                  const QString& relay) {
-        out = {out.calls + 1, ok, isLast, result, status, relay};
-    };
+    return
+        [&out](bool ok, bool isLast, const QVariant& result, const QString& status,
+               const QString& relay) { out = {out.calls + 1, ok, isLast, result, status, relay}; };
 }
 
 ORVOSrvTunnelControl::ReplyCompletion recordReply(Outcome& out)
@@ -63,11 +62,10 @@ private slots:
         const QVariantMap query{{ARG_STATE_FILTER, "<S/>"}, {ARG_RELAY_PATH, "relay/q"}};
         QTest::newRow("query") << 0 << "QryAlarmList" << 4
                                << composer.composeQueryAlarmListMessage(query) << "relay/q" << true;
-        QTest::newRow("process")
-            << 1 << "ProcessAlarm" << 4
-            << composer.composeProcessAlarmMessage({"7", "8"}, {{ARG_ALARM_STATUS, "Handled"}},
-                                                   "done")
-            << "relay/p" << true;
+        QTest::newRow("process") << 1 << "ProcessAlarm" << 4
+                                 << composer.composeProcessAlarmMessage(
+                                        {"7", "8"}, {{ARG_ALARM_STATUS, "Handled"}}, "done")
+                                 << "relay/p" << true;
         QTest::newRow("info") << 2 << "GetAlarmInfo" << 4
                               << composer.composeGetAlarmInfoMessage("42") << "relay/i" << true;
         QTest::newRow("mute") << 3 << "MuteAlarm" << 2
@@ -94,13 +92,13 @@ private slots:
                 recordQuery(outcome)));
             break;
         case 1:
-            QVERIFY(control.processAlarm(client,
-                                         {{ARG_ALARMINFO_ID_LIST, QStringList{"7", "8"}},
-                                          {ARG_ALARMINFO_STATUS,
-                                           QVariantMap{{ARG_ALARM_STATUS, "Handled"}}},
-                                          {ARG_ALARMINFO_NOTE, "done"},
-                                          {ARG_RELAY_PATH, "relay/p"}},
-                                         recordReply(outcome)));
+            QVERIFY(control.processAlarm(
+                client,
+                {{ARG_ALARMINFO_ID_LIST, QStringList{"7", "8"}},
+                 {ARG_ALARMINFO_STATUS, QVariantMap{{ARG_ALARM_STATUS, "Handled"}}},
+                 {ARG_ALARMINFO_NOTE, "done"},
+                 {ARG_RELAY_PATH, "relay/p"}},
+                recordReply(outcome)));
             break;
         case 2:
             QVERIFY(control.getAlarmInfo(client, "42", "relay/i", recordReply(outcome)));
@@ -186,9 +184,8 @@ private slots:
         QFETCH(bool, accepted);
 
         for (const bool isLast : {false, true}) {
-            const FakeTunnelClient::Reply reply{ok, "relay/x", status,
-                                                "<QryAlarmListRes><Alarm/></QryAlarmListRes>",
-                                                isLast};
+            const FakeTunnelClient::Reply reply{
+                ok, "relay/x", status, "<QryAlarmListRes><Alarm/></QryAlarmListRes>", isLast};
             FakeTunnelClient tunnel;
             ORVOSrvTunnelControl control(&tunnel);
 
@@ -264,8 +261,7 @@ private slots:
         QFETCH(QString, replyText);
         Outcome query, process, info;
         ORVOSrvTunnelControl::queryAlarmCB(true, "r", "0", replyText, true, recordQuery(query));
-        ORVOSrvTunnelControl::processAlarmCB(true, "r", "0", replyText, true,
-                                             recordReply(process));
+        ORVOSrvTunnelControl::processAlarmCB(true, "r", "0", replyText, true, recordReply(process));
         ORVOSrvTunnelControl::getAlarmInfoCB(true, "r", "0", replyText, true, recordReply(info));
         for (const Outcome* o : {&query, &process, &info}) {
             QVERIFY(o->ok);
@@ -281,9 +277,10 @@ private slots:
         QVERIFY(out.ok);
         const QVariantList alarms = out.result.toList();
         QCOMPARE(alarms.size(), 3);
-        QCOMPARE(alarms.at(0).toMap(),
-                 (QVariantMap{{"AlarmID", "1"},
-                              {"XML", "    <Alarm>\n        <AlarmID>1</AlarmID>\n    </Alarm>\n"}}));
+        QCOMPARE(
+            alarms.at(0).toMap(),
+            (QVariantMap{{"AlarmID", "1"},
+                         {"XML", "    <Alarm>\n        <AlarmID>1</AlarmID>\n    </Alarm>\n"}}));
         // The alarm's own "XML" child is replaced by its text.
         QCOMPARE(alarms.at(1).toMap().value("XML").toString(),
                  QStringLiteral("    <Alarm>\n        <AlarmID>2</AlarmID>\n"
@@ -346,13 +343,13 @@ private slots:
         std::atomic<int> alarms{0};
         {
             ORVOSrvTunnelControl control(&tunnel);
-            control.queryAlarm(client, QVariant(),
-                               [&](bool ok, bool, const QVariant& result, const QString&,
-                                   const QString&) {
-                                   ++calls;
-                                   if (ok)
-                                       alarms += result.toList().size();
-                               });
+            control.queryAlarm(
+                client, QVariant(),
+                [&](bool ok, bool, const QVariant& result, const QString&, const QString&) {
+                    ++calls;
+                    if (ok)
+                        alarms += result.toList().size();
+                });
         }
         const FakeTunnelClient::Record record = tunnel.last();
         std::vector<std::thread> threads;

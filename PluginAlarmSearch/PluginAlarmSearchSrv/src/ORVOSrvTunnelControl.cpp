@@ -90,8 +90,8 @@ void ORVOSrvTunnelControl::queryAlarmCB(bool ok, const QString& relayPath,
                                         const QString& statusText, const QString& replyText,
                                         bool isLast, QueryAlarmCompletion completion)
 {
-    const std::optional<QVariantMap> reply = readReply(
-        "queryAlarmCB", "%s, QryAlarmList failed, %s", ok, statusText, replyText);
+    const std::optional<QVariantMap> reply =
+        readReply("queryAlarmCB", "%s, QryAlarmList failed, %s", ok, statusText, replyText);
     if (!reply) {
         completion(false, isLast, QVariant(), statusText, relayPath);
         return;
@@ -119,8 +119,8 @@ bool ORVOSrvTunnelControl::processAlarm(void* clientID, const QMap<QString, QVar
 {
     IOrvoTunnelClient::InsertRequestInfo info;
     info.commandText = m_spMessageComposer->composeProcessAlarmMessage(
-        args.value(ARG_ALARMINFO_ID_LIST).toStringList(),
-        args.value(ARG_ALARMINFO_STATUS).toMap(), args.value(ARG_ALARMINFO_NOTE).toString());
+        args.value(ARG_ALARMINFO_ID_LIST).toStringList(), args.value(ARG_ALARMINFO_STATUS).toMap(),
+        args.value(ARG_ALARMINFO_NOTE).toString());
     info.replyCallback = bindReader(&ORVOSrvTunnelControl::processAlarmCB, std::move(completion));
     info.relayPath = args.value(ARG_RELAY_PATH).toString();
     return sendCommand(clientID, METHOD_PROCESS_ALARM, info);
@@ -130,8 +130,8 @@ void ORVOSrvTunnelControl::processAlarmCB(bool ok, const QString& relayPath,
                                           const QString& statusText, const QString& replyText,
                                           bool isLast, ReplyCompletion completion)
 {
-    const std::optional<QVariantMap> reply = readReply(
-        "processAlarmCB", "%s, processAlarm failed, %s", ok, statusText, replyText);
+    const std::optional<QVariantMap> reply =
+        readReply("processAlarmCB", "%s, processAlarm failed, %s", ok, statusText, replyText);
     if (!reply) {
         completion(false, isLast, QVariant(), relayPath);
         return;
@@ -165,8 +165,8 @@ void ORVOSrvTunnelControl::getAlarmInfoCB(bool ok, const QString& relayPath,
                                           const QString& statusText, const QString& replyText,
                                           bool isLast, ReplyCompletion completion)
 {
-    const std::optional<QVariantMap> reply = readReply(
-        "getAlarmInfoCB", "%s, getAlarmInfo failed, %s", ok, statusText, replyText);
+    const std::optional<QVariantMap> reply =
+        readReply("getAlarmInfoCB", "%s, getAlarmInfo failed, %s", ok, statusText, replyText);
     if (!reply) {
         completion(false, isLast, QVariant(), relayPath);
         return;

@@ -22,12 +22,12 @@ class ORVOSrvTunnelControl
 {
 public:
     // reply understood, last-reply flag, alarm maps, server status text, relay path
-    using QueryAlarmCompletion = std::function<void(bool ok, bool isLast, const QVariant& result,
-                                                    const QString& statusText,
-                                                    const QString& relayPath)>;
+    using QueryAlarmCompletion =
+        std::function<void(bool ok, bool isLast, const QVariant& result, const QString& statusText,
+                           const QString& relayPath)>;
     // reply understood, last-reply flag, result, relay path
-    using ReplyCompletion = std::function<void(bool ok, bool isLast, const QVariant& result,
-                                               const QString& relayPath)>;
+    using ReplyCompletion =
+        std::function<void(bool ok, bool isLast, const QVariant& result, const QString& relayPath)>;
 
     explicit ORVOSrvTunnelControl(IOrvoTunnelClient* client);
     virtual ~ORVOSrvTunnelControl();

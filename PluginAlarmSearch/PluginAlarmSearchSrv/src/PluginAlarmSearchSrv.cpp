@@ -27,9 +27,9 @@ bool PluginAlarmSearchSrv::InitialPluginBase(IFrameworkTools* tools)
     HDLR_EVENT_SIGNAL_CB eventSignal = tools->GetEventSignalFunc();
     const bool needsTunnelCtrl = tunnelCtrl().isNull();
     // The host's tunnel client is asked for only when no tunnel control is installed yet.
-    const auto created = needsTunnelCtrl
-                             ? QSharedPointer<ORVOSrvTunnelControl>::create(tools->GetTunnelClient())
-                             : QSharedPointer<ORVOSrvTunnelControl>();
+    const auto created =
+        needsTunnelCtrl ? QSharedPointer<ORVOSrvTunnelControl>::create(tools->GetTunnelClient())
+                        : QSharedPointer<ORVOSrvTunnelControl>();
 
     std::lock_guard lock(m_mutex);
     m_fnEventSignal = std::move(eventSignal);

@@ -54,8 +54,8 @@ void PluginAlarmSearchSrv::handleUpdateAlarm(Qt::HANDLE clientID, const QVariant
     // the plug-in is gone is dropped, and the client gets no answer from a plug-in that no
     // longer exists. The answer and the event carry the request's own relay path.
     auto completion = [guard = m_lifeGuard, reqData, reqCB](bool ok, bool isLast,
-                                                             const QVariant& result,
-                                                             const QString& /*relayPath*/) {
+                                                            const QVariant& result,
+                                                            const QString& /*relayPath*/) {
         guard->visit([&](PluginAlarmSearchSrv* plugin) {
             plugin->handleProcessAlarm(ok, isLast, result, reqData, reqCB);
         });
@@ -78,9 +78,9 @@ void PluginAlarmSearchSrv::handleGetAlarmHistory(Qt::HANDLE clientID, const QVar
     };
 
     const QSharedPointer<ORVOSrvTunnelControl> tunnel = tunnelCtrl();
-    if (!tunnel || !tunnel->getAlarmInfo(clientID, request.value(ARG_ALARM_ID).toString(),
-                                         request.value(ARG_RELAY_PATH).toString(),
-                                         std::move(completion))) {
+    if (!tunnel ||
+        !tunnel->getAlarmInfo(clientID, request.value(ARG_ALARM_ID).toString(),
+                              request.value(ARG_RELAY_PATH).toString(), std::move(completion))) {
         ALARMSEARCH_TRACE_FAILURE("%s, call getAlarmInfo failed", "handleGetAlarmHistory");
         answerNotSent(reqCB);
     }
