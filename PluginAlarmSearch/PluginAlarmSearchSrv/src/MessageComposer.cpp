@@ -59,6 +59,32 @@ QString escapedXml(const QString& text)
     return withoutInvalidXmlChars(text).toHtmlEscaped();
 }
 
+// Removes the processing instructions inside element. They address a parser, not the server,
+// and the DOM writes some targets that its own reader took in (U+FFFD in the name) back out in
+// a form that the reader refuses. Walks without recursion: a fragment may nest deeply.
+void removeProcessingInstructions(const QDomElement& element)
+{
+    QList<QDomNode> found;
+    QDomNode node = element.firstChild();
+    while (!node.isNull() && node != element) {
+        if (node.isProcessingInstruction()) {
+            found.append(node);
+        } else if (node.hasChildNodes()) {
+            node = node.firstChild();
+            continue;
+        }
+        while (node != element && node.nextSibling().isNull()) {
+            node = node.parentNode();
+        }
+        if (node != element) {
+            node = node.nextSibling();
+        }
+    }
+    for (QDomNode& instruction : found) {
+        instruction.parentNode().removeChild(instruction);
+    }
+}
+
 // Parses xml on its own and returns a deep copy of its document element owned by message; a
 // null node (which appends nothing) when nothing parsed. Text that breaks off keeps what was
 // built before the fault, so the parse result is deliberately not looked at.
@@ -66,7 +92,9 @@ QDomNode importFragment(QDomDocument& message, const QString& xml)
 {
     QDomDocument fragment;
     fragment.setContent(xml);
-    return message.importNode(fragment.documentElement(), true);
+    const QDomElement element = fragment.documentElement();
+    removeProcessingInstructions(element);
+    return message.importNode(element, true);
 }
 
 QDomElement textElement(QDomDocument& message, const QString& tagName, const QString& text,
