@@ -1,0 +1,313 @@
+// Many threads at once: replies of every kind delivered from several threads while subscriptions
+// come and go, and a plug-in deleted while its replies are still being delivered.
+
+#include "support/FakeHost.h"
+
+#include <PluginAlarmSearchCommon.h>
+#include <PluginAlarmSearchSrv.h>
+#include <RequestSenderInfo.h>
+
+#include <QSet>
+#include <QtTest>
+
+#include <algorithm>
+#include <atomic>
+#include <memory>
+#include <thread>
+#include <vector>
+
+using namespace PluginAlarmSearchCommon;
+
+namespace {
+
+enum class Kind { Query, Update, History };
+enum class Outcome { Accepted, Rejected, Unparseable };
+
+// Request i asks for kind i % 3 and gets a reply of outcome (i / 3) % 3, so every pairing occurs.
+Kind kindOf(int i)
+{
+    return Kind(i % 3);
+}
+Outcome outcomeOf(int i)
+{
+    return Outcome((i / 3) % 3);
+}
+
+const QString permanentKey = QStringLiteral("permanent");
+const QString rejectedStatus = QStringLiteral("80000000");
+
+QString methodOf(Kind kind)
+{
+    switch (kind) {
+    case Kind::Query:
+        return METHOD_QUERY_ALARM_LIST;
+    case Kind::Update:
+        return METHOD_UPDATE_ALARM;
+    case Kind::History:
+        break;
+    }
+    return METHOD_GET_ALARM_HISTORY;
+}
+
+QString acceptedReply(Kind kind)
+{
+    switch (kind) {
+    case Kind::Query:
+        return QStringLiteral("<QryAlarmListRes><Alarm><ID>1</ID></Alarm></QryAlarmListRes>");
+    case Kind::Update:
+        return QStringLiteral("<ProcessAlarmRes><Result><AlarmID>A1</AlarmID><Code>0</Code>"
+                              "</Result><Result><AlarmID>A2</AlarmID><Code>1</Code></Result>"
+                              "</ProcessAlarmRes>");
+    case Kind::History:
+        break;
+    }
+    return QStringLiteral("<GetAlarmInfoRes><Alarm><ChangeLogs><Entry><Note>n</Note></Entry>"
+                          "</ChangeLogs></Alarm></GetAlarmInfoRes>");
+}
+
+// Delivers the reply of the given outcome to a recorded request.
+void deliver(const FakeTunnelClient::Record& record, Kind kind, Outcome outcome)
+{
+    FakeTunnelClient::Reply reply;
+    reply.relayPath = record.relayPath;
+    reply.replyText = acceptedReply(kind);
+    if (outcome == Outcome::Rejected)
+        reply.statusText = rejectedStatus;
+    else if (outcome == Outcome::Unparseable)
+        reply.replyText = QStringLiteral("<ProcessAlarmRes><Result>");
+    FakeTunnelClient::deliver(record, reply);
+}
+
+// The answer code a reply of this kind and outcome must produce.
+QString expectedCode(Kind kind, Outcome outcome)
+{
+    if (kind == Kind::Query) // the server's status text, whatever became of the reply
+        return outcome == Outcome::Rejected ? rejectedStatus : QStringLiteral("0");
+    return outcome == Outcome::Accepted ? QStringLiteral("0") : QStringLiteral("-1");
+}
+
+// Records what the plug-in hands back, per request; requests are told apart by relay path,
+// which is the request's index.
+class Tally
+{
+public:
+    explicit Tally(int requests) : m_answers(requests) {}
+
+    HDLR_DO_REQUEST_CB answerSink(int index)
+    {
+        return [this, index](bool, const QString& code, const QString&, const QVariant&) {
+            std::lock_guard lock(m_mutex);
+            m_answers[index].append(code);
+            if (kindOf(index) == Kind::Update && m_pluginDeleted)
+                ++m_updateAnswersAfterDeletion;
+        };
+    }
+
+    HDLR_EVENT_SIGNAL_CB eventSink()
+    {
+        return [this](const PluginObjBase_EventSignalInfo* info) {
+            const QVariantMap data = info->eventData.toMap();
+            const int index = data.value(ARG_RELAY_PATH).toString().toInt();
+            std::lock_guard lock(m_mutex);
+            const bool understoodUpdate =
+                kindOf(index) == Kind::Update && outcomeOf(index) == Outcome::Accepted;
+            if (!understoodUpdate || !m_everSubscribed.contains(info->subscriptionKey) ||
+                data.value(ARG_ALARM_UPDATED_RESULTS).toList().size() != 2 || m_pluginDeleted)
+                ++m_badEvents;
+            if (info->subscriptionKey == permanentKey)
+                m_permanentEvents.append(index);
+            ++m_events;
+        };
+    }
+
+    // Called before the key is subscribed, so that every event for it finds it here.
+    void willSubscribe(const QString& key)
+    {
+        std::lock_guard lock(m_mutex);
+        m_everSubscribed.insert(key);
+    }
+
+    void pluginDeleted()
+    {
+        std::lock_guard lock(m_mutex);
+        m_pluginDeleted = true;
+    }
+
+    QList<QStringList> answers() const
+    {
+        std::lock_guard lock(m_mutex);
+        return m_answers;
+    }
+    QList<int> permanentEvents() const
+    {
+        std::lock_guard lock(m_mutex);
+        return m_permanentEvents;
+    }
+    int events() const
+    {
+        std::lock_guard lock(m_mutex);
+        return m_events;
+    }
+    int badEvents() const
+    {
+        std::lock_guard lock(m_mutex);
+        return m_badEvents;
+    }
+    int updateAnswersAfterDeletion() const
+    {
+        std::lock_guard lock(m_mutex);
+        return m_updateAnswersAfterDeletion;
+    }
+
+private:
+    mutable std::mutex m_mutex;
+    QList<QStringList> m_answers;
+    QSet<QString> m_everSubscribed;
+    QList<int> m_permanentEvents;
+    int m_events = 0;
+    int m_badEvents = 0;
+    bool m_pluginDeleted = false;
+    int m_updateAnswersAfterDeletion = 0;
+};
+
+// A started plug-in whose host events go to the tally, with the given requests pending.
+struct Storm
+{
+    FakeHost host;
+    Tally tally;
+    std::unique_ptr<PluginAlarmSearchSrv> plugin = std::make_unique<PluginAlarmSearchSrv>();
+
+    explicit Storm(int requests) : tally(requests)
+    {
+        host.eventSignal = tally.eventSink();
+        plugin->InitialPluginBase(&host);
+        subscribe(permanentKey);
+        RequestSenderInfo sender;
+        for (int i = 0; i < requests; ++i) {
+            const QVariantMap args{{ARG_RELAY_PATH, QString::number(i)},
+                                   {ARG_ALARM_ID_LIST, QStringList{QStringLiteral("A1")}},
+                                   {ARG_ALARM_ID, QStringLiteral("A1")}};
+            plugin->Request(methodOf(kindOf(i)), args, sender, tally.answerSink(i));
+        }
+    }
+
+    void subscribe(const QString& key)
+    {
+        tally.willSubscribe(key);
+        UntouchedResponser responser;
+        plugin->SubscribeEventBlock(key, EVENT_ALARM_UPDATED, QVariant(), RequestSenderInfo(),
+                                    responser);
+    }
+
+    void unsubscribe(const QString& key)
+    {
+        UntouchedResponser responser;
+        plugin->UnsubscribeEventBlock(key, QVariant(), responser);
+    }
+};
+
+// Runs work(thread) on each of count threads and waits for all of them.
+template <typename Work> void onThreads(int count, Work work)
+{
+    std::vector<std::thread> threads;
+    for (int t = 0; t < count; ++t)
+        threads.emplace_back(work, t);
+    for (std::thread& thread : threads)
+        thread.join();
+}
+
+constexpr int Deliverers = 8;
+
+} // namespace
+
+class TestStorm : public QObject
+{
+    Q_OBJECT
+
+private slots:
+    void repliesWhileSubscriptionsChange()
+    {
+        constexpr int Requests = 10000;
+        Storm storm(Requests);
+        const QList<FakeTunnelClient::Record> records = storm.host.tunnel.records();
+        QCOMPARE(records.size(), Requests);
+
+        std::atomic<bool> delivering{true};
+        std::thread subscriber([&] {
+            const QStringList keys{QStringLiteral("k0"), QStringLiteral("k1"), QStringLiteral("k2"),
+                                   QStringLiteral("k3")};
+            for (int n = 0; delivering.load(); ++n) {
+                storm.subscribe(keys.at(n % 4));
+                storm.unsubscribe(keys.at((n + 2) % 4));
+                storm.unsubscribe(QStringLiteral("never subscribed"));
+            }
+        });
+        onThreads(Deliverers, [&](int thread) {
+            for (int i = thread; i < Requests; i += Deliverers)
+                deliver(records.at(i), kindOf(i), outcomeOf(i));
+        });
+        delivering = false;
+        subscriber.join();
+
+        // Every reply produced exactly one answer, with the code its kind and outcome call for.
+        const QList<QStringList> answers = storm.tally.answers();
+        QList<int> understoodUpdates;
+        for (int i = 0; i < Requests; ++i) {
+            QCOMPARE(answers.at(i), QStringList{expectedCode(kindOf(i), outcomeOf(i))});
+            if (kindOf(i) == Kind::Update && outcomeOf(i) == Outcome::Accepted)
+                understoodUpdates.append(i);
+        }
+        // Events came only for understood updates, and the key that stayed subscribed throughout
+        // saw each of them exactly once.
+        QCOMPARE(storm.tally.badEvents(), 0);
+        QList<int> permanentEvents = storm.tally.permanentEvents();
+        std::sort(permanentEvents.begin(), permanentEvents.end());
+        QCOMPARE(permanentEvents, understoodUpdates);
+        QVERIFY(storm.tally.events() >= understoodUpdates.size());
+    }
+
+    void deletionWithRepliesPending()
+    {
+        constexpr int Requests = 600;
+        Storm storm(Requests);
+        const QList<FakeTunnelClient::Record> records = storm.host.tunnel.records();
+
+        // Four threads deliver the replies, the first half before the plug-in is deleted and the
+        // rest while or after it goes.
+        std::atomic<int> delivered{0};
+        std::thread deleter([&] {
+            while (delivered.load() < Requests / 2)
+                std::this_thread::yield();
+            storm.plugin.reset();
+            storm.tally.pluginDeleted();
+        });
+        onThreads(4, [&](int thread) {
+            for (int i = thread; i < Requests; i += 4) {
+                deliver(records.at(i), kindOf(i), outcomeOf(i));
+                ++delivered;
+            }
+        });
+        deleter.join();
+        // Late replies once more, all after the deletion.
+        onThreads(4, [&](int thread) {
+            for (int i = thread; i < Requests; i += 4)
+                deliver(records.at(i), kindOf(i), outcomeOf(i));
+        });
+
+        // Queries and history reads need nothing of the plug-in and are answered every time;
+        // an update is answered at most once, never after the deletion, and publishes nothing
+        // then.
+        const QList<QStringList> answers = storm.tally.answers();
+        for (int i = 0; i < Requests; ++i) {
+            if (kindOf(i) == Kind::Update)
+                QVERIFY(answers.at(i).size() <= 1);
+            else
+                QCOMPARE(answers.at(i).size(), 2);
+        }
+        QCOMPARE(storm.tally.updateAnswersAfterDeletion(), 0);
+        QCOMPARE(storm.tally.badEvents(), 0);
+    }
+};
+
+QTEST_GUILESS_MAIN(TestStorm)
+#include "tst_storm.moc"
