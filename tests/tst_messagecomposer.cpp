@@ -386,6 +386,20 @@ private slots:
         QCOMPARE(textAt(query, "DeviceName"), readBack);
     }
 
+    // Found by fuzzing: the DOM reads "<?p\uFFFDx?>" but writes it back as "<?p\uFFFDx ?>",
+    // which its own reader refuses. Processing instructions never reach the server.
+    void filterProcessingInstructions()
+    {
+        const QString instruction = QStringLiteral("<?p\uFFFDx?>");
+        const QString message = composer.composeQueryAlarmListMessage(QVariantMap{
+            {ARG_TRIGGER_EVENT_FILTER, instruction + "<Event>Motion</Event>" + instruction},
+            {ARG_STATE_FILTER, "<S><A>" + instruction + "<B/></A>" + instruction + "</S>"}});
+        QVERIFY2(isWellFormed(message), qPrintable(message));
+        QVERIFY2(!message.contains(QLatin1String("<?")), qPrintable(message));
+        QCOMPARE(structureOf(parsed(message).firstChildElement("Filters")),
+                 "Filters(TriggerEventList(Event())S(A(B())))");
+    }
+
     void systemTimeZone_data()
     {
         QTest::addColumn<QByteArray>("zone");
