@@ -45,7 +45,9 @@ void PluginAlarmSearchSrv::emitEventSignal(const QString& eventName,
                                            const QVariant& eventData) const
 {
     // Copies taken under the lock; the host is called outside it, so its callback may
-    // subscribe or unsubscribe without deadlocking.
+    // subscribe or unsubscribe without deadlocking. The keys get a list buffer of their own:
+    // Qt decides whether a shared buffer may be changed in place by a relaxed read of its
+    // reference count, which does not order this thread's reads before another's writes.
     QStringList keys;
     HDLR_EVENT_SIGNAL_CB eventSignal;
     {
@@ -53,6 +55,7 @@ void PluginAlarmSearchSrv::emitEventSignal(const QString& eventName,
         if (m_lstSubscriptionKeys.isEmpty() || !m_fnEventSignal)
             return;
         keys = m_lstSubscriptionKeys;
+        keys.detach();
         eventSignal = m_fnEventSignal;
     }
 
