@@ -11,9 +11,9 @@ public:
     // Reply to a request: exchange succeeded, a text plug-ins ignore, relay path, status text
     // (hexadecimal; bit 31 set means failure), reply XML, last-reply flag. May be called on any
     // thread and more than once per request.
-    using ReplyCallback = std::function<void(bool ok, const QString& info, const QString& relayPath,
-                                             const QString& statusText, const QString& replyText,
-                                             bool isLast)>;
+    using ReplyCallback =
+        std::function<void(bool ok, const QString& info, const QString& relayPath,
+                           const QString& statusText, const QString& replyText, bool isLast)>;
 
     enum RequestKind : int {
         RequestNoReply = 2,   // fire and forget: no reply callback

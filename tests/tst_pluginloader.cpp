@@ -1,6 +1,12 @@
-#include <IPluginObjectBase.h>
-#include <PluginLoader.h>
+// The built plug-in file as a host sees it: loaded with QPluginLoader, known only through the
+// host interface headers.
 
+#include "support/FakeHost.h"
+
+#include <IPluginObjectBase.h>
+#include <RequestSenderInfo.h>
+
+#include <QPluginLoader>
 #include <QtTest>
 
 class TestPluginLoader : public QObject
@@ -8,57 +14,70 @@ class TestPluginLoader : public QObject
     Q_OBJECT
 
 private slots:
-    void loadsGoodPlugin()
+    void metaData()
     {
-        PluginLoader loader;
-        QString error;
-        QVERIFY2(loader.load(QStringLiteral(FIXTURE_GoodPlugin), &error), qPrintable(error));
-        QVERIFY(loader.plugin());
-        QCOMPARE(loader.pluginId(), QStringLiteral("FIXTURE0000000000000000000000001"));
-        QVERIFY(error.isEmpty());
+        QPluginLoader loader(QStringLiteral(ALARMSEARCH_PLUGIN_FILE));
+        const QJsonObject meta = loader.metaData();
+        QCOMPARE(meta.value("IID").toString(),
+                 QStringLiteral("com.KELMARO.PluginServer.PluginInterface"));
+        QCOMPARE(meta.value("className").toString(), QStringLiteral("PluginAlarmSearchSrv"));
+        QCOMPARE(meta.value("MetaData").toObject(),
+                 (QJsonObject{{"PluginID", "C758778662E44060AC6E2EC5C9AD349B"}}));
     }
 
-    void rejectsBadFiles_data()
+    void oneGuardedInstance()
     {
-        QTest::addColumn<QString>("file");
-        QTest::addColumn<QString>("reason");
-        QTest::newRow("missing file")
-            << QStringLiteral("/nonexistent/libNothing.so") << QStringLiteral("no such file");
-        QTest::newRow("no Qt plug-in")
-            << QStringLiteral(FIXTURE_PlainLibrary) << QStringLiteral("not a Qt plug-in");
-        QTest::newRow("other interface")
-            << QStringLiteral(FIXTURE_OtherIidPlugin)
-            << QStringLiteral("interface identifier \"com.example.SomeOtherInterface\"");
-        QTest::newRow("no PluginID")
-            << QStringLiteral(FIXTURE_NoPluginIdPlugin) << QStringLiteral("no \"PluginID\"");
-        QTest::newRow("not an IPluginObjectBase")
-            << QStringLiteral(FIXTURE_PlainObjectPlugin)
-            << QStringLiteral("instance of PlainObjectPlugin is no IPluginObjectBase");
+        QPluginLoader loader(QStringLiteral(ALARMSEARCH_PLUGIN_FILE));
+        QObject* instance = loader.instance();
+        QVERIFY2(instance, qPrintable(loader.errorString()));
+        QCOMPARE(loader.instance(), instance);
+        QVERIFY(qobject_cast<IPluginObjectBase*>(instance));
+        QCOMPARE(instance->metaObject()->className(), "PluginAlarmSearchSrv");
+
+        delete instance;
+        QObject* renewed = loader.instance();
+        QVERIFY(renewed);
+        QVERIFY(qobject_cast<IPluginObjectBase*>(renewed));
+        delete renewed;
     }
 
-    void rejectsBadFiles()
+    void servesRequestsAndEvents()
     {
-        QFETCH(QString, file);
-        QFETCH(QString, reason);
-        PluginLoader loader;
-        QString error;
-        QVERIFY(!loader.load(file, &error));
-        QVERIFY(!loader.plugin());
-        QVERIFY2(error.startsWith(QStringLiteral("cannot load plug-in ") + file),
-                 qPrintable(error));
-        QVERIFY2(error.contains(reason), qPrintable(error));
-        QVERIFY2(!error.contains(QLatin1Char('\n')), qPrintable(error));
-        // The loader's own explanation comes along, in parentheses.
-        QVERIFY2(error.endsWith(QLatin1Char(')')), qPrintable(error));
-    }
+        QPluginLoader loader(QStringLiteral(ALARMSEARCH_PLUGIN_FILE));
+        auto* plugin = qobject_cast<IPluginObjectBase*>(loader.instance());
+        QVERIFY2(plugin, qPrintable(loader.errorString()));
 
-    void defaultPathFollowsEnvironment()
-    {
-        qputenv("ALARMSEARCH_PLUGIN", "/opt/x/libP.so");
-        QCOMPARE(PluginLoader::defaultPluginPath(), QStringLiteral("/opt/x/libP.so"));
-        qunsetenv("ALARMSEARCH_PLUGIN");
-        QVERIFY(PluginLoader::defaultPluginPath().endsWith(
-            QStringLiteral("/../plugins/libPluginAlarmSearchSrv.so")));
+        FakeHost host;
+        QVERIFY(plugin->InitialPluginBase(&host));
+        RequestSenderInfo sender;
+        sender.clientHandle = reinterpret_cast<Qt::HANDLE>(0x51);
+        UntouchedResponser responser;
+        plugin->SubscribeEventBlock("key", "AlarmUpdated", QVariant(), sender, responser);
+
+        plugin->Request("QryAlarmList", QVariantMap{{"relayPath", "r"}}, sender, host.answerSink());
+        QCOMPARE(host.tunnel.last().method, QStringLiteral("QryAlarmList"));
+        QCOMPARE(host.tunnel.last().clientID, sender.clientHandle);
+        host.tunnel.replyOnThread(
+            {true, "r", "0",
+             "<QryAlarmListRes><Alarm><AlarmID>A1</AlarmID></Alarm></QryAlarmListRes>", true});
+
+        plugin->Request("UpdateAlarm",
+                        QVariantMap{{"alarmIdList", QStringList{"A1"}}, {"alarmStatus", "Handled"}},
+                        sender, host.answerSink());
+        host.tunnel.replyOnThread(
+            {true, "", "0",
+             "<ProcessAlarmRes><Result><AlarmID>A1</AlarmID><Code>0</Code></Result>"
+             "</ProcessAlarmRes>",
+             true});
+
+        QCOMPARE(host.journal(), (QStringList{"answer 0", "event key", "answer 0"}));
+        const QVariantList alarms =
+            host.answers().first().result.toMap().value("queryResult").toList();
+        QCOMPARE(alarms.size(), 1);
+        QCOMPARE(alarms.first().toMap().value("XML").toString(),
+                 QStringLiteral("    <Alarm>\n        <AlarmID>A1</AlarmID>\n    </Alarm>\n"));
+        QCOMPARE(responser.calls, 0);
+        delete plugin;
     }
 };
 

@@ -1,0 +1,414 @@
+#include <MessageComposer.h>
+#include <PluginAlarmSearchCommon.h>
+
+#include <QDomDocument>
+#include <QTimeZone>
+#include <QXmlStreamReader>
+#include <QtTest>
+
+#include <limits>
+
+using namespace PluginAlarmSearchCommon;
+
+namespace {
+
+const QString EmptyTimeBound =
+    QStringLiteral("<TmBound><TZ>+00:00</TZ><StartTm/><EndTm/></TmBound>");
+
+// The query message around the given content of "Filters" and the given time bound.
+QString expectedQuery(const QString& filters, const QString& timeBound = EmptyTimeBound)
+{
+    return QLatin1String("<QryAlarmList><Filters>") + filters + QLatin1String("</Filters>") +
+           timeBound +
+           QLatin1String("<TmBase useUTC=\"true\">Station</TmBase><MaxRec>5000</MaxRec>"
+                         "<OrderBy><Field>ServerTime</Field><Descending>true</Descending>"
+                         "</OrderBy></QryAlarmList>");
+}
+
+QString timeBound(const QString& start, const QString& end)
+{
+    return QStringLiteral("<TmBound><TZ>+00:00</TZ><StartTm>") + start +
+           QStringLiteral("</StartTm><EndTm>") + end + QStringLiteral("</EndTm></TmBound>");
+}
+
+QVariantMap rule(const QVariant& type, const QVariantList& tags)
+{
+    QVariantMap entry{{QStringLiteral("tagList"), tags}};
+    if (type.isValid()) {
+        entry.insert(QStringLiteral("type"), type);
+    }
+    return entry;
+}
+
+bool isWellFormed(const QString& xml)
+{
+    QXmlStreamReader reader(xml);
+    while (!reader.atEnd()) {
+        reader.readNext();
+    }
+    return !reader.hasError();
+}
+
+// Element and attribute names of the tree in document order, e.g. "A[id](B()C())".
+QString structureOf(const QDomElement& element)
+{
+    QString shape = element.tagName();
+    const QDomNamedNodeMap attributes = element.attributes();
+    if (!attributes.isEmpty()) {
+        QStringList names;
+        for (int i = 0; i < attributes.count(); ++i) {
+            names.append(attributes.item(i).nodeName());
+        }
+        names.sort();
+        shape += QLatin1Char('[') + names.join(QLatin1Char(',')) + QLatin1Char(']');
+    }
+    shape += QLatin1Char('(');
+    for (QDomElement child = element.firstChildElement(); !child.isNull();
+         child = child.nextSiblingElement()) {
+        shape += structureOf(child);
+    }
+    return shape + QLatin1Char(')');
+}
+
+QDomElement parsed(const QString& xml)
+{
+    QDomDocument document;
+    document.setContent(xml);
+    return document.documentElement();
+}
+
+QString textAt(const QDomElement& root, const QString& tagName)
+{
+    return root.elementsByTagName(tagName).at(0).toElement().text();
+}
+
+} // namespace
+
+class TestMessageComposer : public QObject
+{
+    Q_OBJECT
+
+private:
+    MessageComposer composer;
+
+private slots:
+    void initTestCase()
+    {
+        // Before any time zone is looked up.
+        qputenv("TZ", "UTC");
+        QVERIFY(!isWellFormed(QStringLiteral("<a>\x01</a>")));
+    }
+
+    void emptyQuery()
+    {
+        QCOMPARE(
+            composer.composeQueryAlarmListMessage(QVariantMap()),
+            QStringLiteral("<QryAlarmList><Filters><TriggerEventList/></Filters><TmBound>"
+                           "<TZ>+00:00</TZ><StartTm/><EndTm/></TmBound><TmBase useUTC=\"true\">"
+                           "Station</TmBase><MaxRec>5000</MaxRec><OrderBy><Field>ServerTime"
+                           "</Field><Descending>true</Descending></OrderBy></QryAlarmList>"));
+    }
+
+    void nonMapArgument_data()
+    {
+        QTest::addColumn<QVariant>("args");
+        QTest::newRow("invalid") << QVariant();
+        QTest::newRow("text") << QVariant(QStringLiteral("<Filters/>"));
+        QTest::newRow("list") << QVariant(QVariantList{ARG_START_TIME, QStringLiteral("x")});
+    }
+
+    void nonMapArgument()
+    {
+        QFETCH(QVariant, args);
+        QCOMPARE(composer.composeQueryAlarmListMessage(args), expectedQuery("<TriggerEventList/>"));
+    }
+
+    void queryMessage_data()
+    {
+        QTest::addColumn<QVariantMap>("request");
+        QTest::addColumn<QString>("filters");
+        QTest::addColumn<QString>("timeBound");
+
+        const QString rules = ARG_RULES;
+        QTest::newRow("rule without type is a name list")
+            << QVariantMap{{rules, QVariantList{rule({}, {"a"})}}}
+            << "<TriggerEventList/><NameList><Name>a</Name></NameList>" << EmptyTimeBound;
+        QTest::newRow("rule of type 2 adds nothing")
+            << QVariantMap{{rules, QVariantList{rule(2, {"a"}), rule(-1, {"b"})}}}
+            << "<TriggerEventList/>" << EmptyTimeBound;
+        QTest::newRow("device rule without tags")
+            << QVariantMap{{rules, QVariantList{rule(1, {}), rule(QStringLiteral("1"), {})}}}
+            << "<TriggerEventList/><TriggerDeviceNameList/><TriggerDeviceNameList/>"
+            << EmptyTimeBound;
+        QTest::newRow("names percent-encoded, device names escaped")
+            << QVariantMap{{rules, QVariantList{rule(0, {"a b", "x/y", QStringLiteral("caf\u00e9"),
+                                                         "", 42, "R&D<1>", "A-z_0.~"}),
+                                                rule(1, {"a b", "x/y", QStringLiteral("caf\u00e9"),
+                                                         "", 42, "R&D<1>"})}}}
+            << "<TriggerEventList/><NameList><Name>a%20b</Name><Name>x%2Fy</Name>"
+               "<Name>caf%C3%A9</Name><Name></Name><Name>42</Name><Name>R%26D%3C1%3E</Name>"
+               "<Name>A-z_0.~</Name></NameList><TriggerDeviceNameList>"
+               "<DeviceName>a b</DeviceName><DeviceName>x/y</DeviceName>"
+               "<DeviceName>caf\u00e9</DeviceName><DeviceName></DeviceName>"
+               "<DeviceName>42</DeviceName><DeviceName>R&amp;D&lt;1></DeviceName>"
+               "</TriggerDeviceNameList>"
+            << EmptyTimeBound;
+        QTest::newRow("filters in order")
+            << QVariantMap{{ARG_TRIGGER_EVENT_FILTER, "<Event>RecErr</Event>"},
+                           {ARG_STATE_FILTER, "<State>Unhandled</State>"},
+                           {rules, QVariantList{rule(1, {"d"}), rule(0, {"n"}), rule(1, {"e"})}},
+                           {ARG_RELAY_PATH, "ignored"}}
+            << "<TriggerEventList><Event>RecErr</Event></TriggerEventList><State>Unhandled</State>"
+               "<TriggerDeviceNameList><DeviceName>d</DeviceName></TriggerDeviceNameList>"
+               "<NameList><Name>n</Name></NameList>"
+               "<TriggerDeviceNameList><DeviceName>e</DeviceName></TriggerDeviceNameList>"
+            << EmptyTimeBound;
+        for (const QString& filter :
+             {CAMERA_TRIGGER_EVENT_FILTER_STRING, SYSTEM_TRIGGER_EVENT_FILTER_STRING,
+              EXTERNAL_DEVICE_TRIGGER_EVENT_FILTER_STRING}) {
+            QTest::addRow("event filter of %lld characters", qlonglong(filter.size()))
+                << QVariantMap{{ARG_TRIGGER_EVENT_FILTER, filter}}
+                << "<TriggerEventList>" + QString(filter).remove('\n') + "</TriggerEventList>"
+                << EmptyTimeBound;
+        }
+        QTest::newRow("broken trigger filter kept up to the fault")
+            << QVariantMap{{ARG_TRIGGER_EVENT_FILTER, "<Event>X</Event><Event>"}}
+            << "<TriggerEventList><Event>X</Event><Event/></TriggerEventList>" << EmptyTimeBound;
+        QTest::newRow("trigger filter cannot leave its list")
+            << QVariantMap{{ARG_TRIGGER_EVENT_FILTER,
+                            "</TriggerEventList><Evil/><TriggerEventList>"}}
+            << "<TriggerEventList/>" << EmptyTimeBound;
+        QTest::newRow("broken state filter") << QVariantMap{{ARG_STATE_FILTER, "<State>Unhandled"}}
+                                             << "<TriggerEventList/><State/>" << EmptyTimeBound;
+        QTest::newRow("state filter with two elements")
+            << QVariantMap{{ARG_STATE_FILTER, "<A>1</A><B/>"}} << "<TriggerEventList/><A>1</A>"
+            << EmptyTimeBound;
+        QTest::newRow("state filter not XML") << QVariantMap{{ARG_STATE_FILTER, "Unhandled"}}
+                                              << "<TriggerEventList/>" << EmptyTimeBound;
+        QTest::newRow("times") << QVariantMap{{ARG_START_TIME, "2024-01-01T00:00:00"},
+                                              {ARG_END_TIME, "2024-01-31T23:59:59"}}
+                               << "<TriggerEventList/>"
+                               << timeBound("2024-01-01T00:00:00", "2024-01-31T23:59:59");
+        QTest::newRow("start time only")
+            << QVariantMap{{ARG_START_TIME, "2024-01-01"}} << "<TriggerEventList/>"
+            << "<TmBound><TZ>+00:00</TZ><StartTm>2024-01-01</StartTm><EndTm/></TmBound>";
+        QTest::newRow("times with markup are text")
+            << QVariantMap{{ARG_START_TIME, "<x"}, {ARG_END_TIME, "a\"b&c>d'"}}
+            << "<TriggerEventList/>" << timeBound("&lt;x", "a\"b&amp;c>d'");
+        QTest::newRow("time cannot add elements")
+            << QVariantMap{{ARG_START_TIME, "</StartTm><Evil/><StartTm>"}} << "<TriggerEventList/>"
+            << "<TmBound><TZ>+00:00</TZ><StartTm>&lt;/StartTm>&lt;Evil/>&lt;StartTm></StartTm>"
+               "<EndTm/></TmBound>";
+        QTest::newRow("markers in times inserted once")
+            << QVariantMap{{ARG_START_TIME, "%1"}, {ARG_END_TIME, "%2%3"}} << "<TriggerEventList/>"
+            << timeBound("%1", "%2%3");
+        QTest::newRow("characters XML cannot carry dropped")
+            << QVariantMap{{ARG_START_TIME, QStringLiteral("a\x01z")},
+                           {ARG_END_TIME, QStringLiteral("c\uFFFFd") + QChar(0xDC00)},
+                           {rules, QVariantList{rule(1, {QStringLiteral("x\x1fy"),
+                                                         QString(QChar(0xD800)) + "z",
+                                                         QStringLiteral("\U0001F600")}),
+                                                rule(0, {QStringLiteral("x\x1fy")})}}}
+            << "<TriggerEventList/><TriggerDeviceNameList><DeviceName>xy</DeviceName>"
+               "<DeviceName>z</DeviceName><DeviceName>\U0001F600</DeviceName>"
+               "</TriggerDeviceNameList><NameList><Name>x%1Fy</Name></NameList>"
+            << timeBound("az", "cd");
+    }
+
+    void queryMessage()
+    {
+        QFETCH(QVariantMap, request);
+        QFETCH(QString, filters);
+        QFETCH(QString, timeBound);
+        const QString message = composer.composeQueryAlarmListMessage(request);
+        QCOMPARE(message, expectedQuery(filters, timeBound));
+        QVERIFY(isWellFormed(message));
+    }
+
+    void processMessage_data()
+    {
+        QTest::addColumn<QStringList>("ids");
+        QTest::addColumn<QVariantMap>("status");
+        QTest::addColumn<QString>("note");
+        QTest::addColumn<QString>("expected");
+
+        QTest::newRow("empty") << QStringList() << QVariantMap() << QString()
+                               << "<ProcessAlarm><AlarmList></AlarmList></ProcessAlarm>";
+        QTest::newRow("typical, duplicates kept in order")
+            << QStringList{"7", "3", "7"} << QVariantMap{{ARG_ALARM_STATUS, "Handled"}} << "checked"
+            << "<ProcessAlarm><AlarmList><Alarm ID=\"7\"/><Alarm ID=\"3\"/><Alarm ID=\"7\"/>"
+               "</AlarmList><Status><State>Handled</State></Status><Note>checked</Note>"
+               "</ProcessAlarm>";
+        QTest::newRow("status map without the key")
+            << QStringList{"1"} << QVariantMap{{"AlarmStatus", "Handled"}} << QString()
+            << "<ProcessAlarm><AlarmList><Alarm ID=\"1\"/></AlarmList><Status></Status>"
+               "</ProcessAlarm>";
+        QTest::newRow("empty state")
+            << QStringList() << QVariantMap{{ARG_ALARM_STATUS, ""}} << QString()
+            << "<ProcessAlarm><AlarmList></AlarmList><Status><State></State></Status>"
+               "</ProcessAlarm>";
+        QTest::newRow("values escaped")
+            << QStringList{"1\"/><Alarm ID=\"2"} << QVariantMap{{ARG_ALARM_STATUS, "<Evil/>&"}}
+            << "a<b & \"c\" >"
+            << "<ProcessAlarm><AlarmList><Alarm ID=\"1&quot;/&gt;&lt;Alarm ID=&quot;2\"/>"
+               "</AlarmList><Status><State>&lt;Evil/&gt;&amp;</State></Status>"
+               "<Note>a&lt;b &amp; &quot;c&quot; &gt;</Note></ProcessAlarm>";
+        QTest::newRow("markers inserted once")
+            << QStringList{"%1", "%2"} << QVariantMap{{ARG_ALARM_STATUS, "%1"}} << "%1"
+            << "<ProcessAlarm><AlarmList><Alarm ID=\"%1\"/><Alarm ID=\"%2\"/></AlarmList>"
+               "<Status><State>%1</State></Status><Note>%1</Note></ProcessAlarm>";
+        QTest::newRow("characters XML cannot carry dropped")
+            << QStringList{QStringLiteral("a\x01")} << QVariantMap{{ARG_ALARM_STATUS, "b\x1f"}}
+            << QStringLiteral("c\x0b\td")
+            << "<ProcessAlarm><AlarmList><Alarm ID=\"a\"/></AlarmList><Status><State>b</State>"
+               "</Status><Note>c\td</Note></ProcessAlarm>";
+    }
+
+    void processMessage()
+    {
+        QFETCH(QStringList, ids);
+        QFETCH(QVariantMap, status);
+        QFETCH(QString, note);
+        QFETCH(QString, expected);
+        const QString message = composer.composeProcessAlarmMessage(ids, status, note);
+        QCOMPARE(message, expected);
+        QVERIFY(isWellFormed(message));
+    }
+
+    void alarmInfoMessage_data()
+    {
+        QTest::addColumn<QString>("alarmId");
+        QTest::addColumn<QString>("expected");
+        QTest::newRow("empty") << QString() << "<GetAlarmInfo><AlarmID></AlarmID></GetAlarmInfo>";
+        QTest::newRow("typical") << "1234"
+                                 << "<GetAlarmInfo><AlarmID>1234</AlarmID></GetAlarmInfo>";
+        QTest::newRow("escaped")
+            << "</AlarmID><Evil/>&"
+            << "<GetAlarmInfo><AlarmID>&lt;/AlarmID&gt;&lt;Evil/&gt;&amp;</AlarmID></GetAlarmInfo>";
+        QTest::newRow("marker") << "%1"
+                                << "<GetAlarmInfo><AlarmID>%1</AlarmID></GetAlarmInfo>";
+    }
+
+    void alarmInfoMessage()
+    {
+        QFETCH(QString, alarmId);
+        QFETCH(QString, expected);
+        const QString message = composer.composeGetAlarmInfoMessage(alarmId);
+        QCOMPARE(message, expected);
+        QVERIFY(isWellFormed(message));
+    }
+
+    void muteMessage_data()
+    {
+        QTest::addColumn<QStringList>("ids");
+        QTest::addColumn<bool>("mute");
+        QTest::addColumn<int>("interval");
+        QTest::addColumn<QString>("expected");
+
+        const auto message = [](const QString& ids, const QString& mute, const QString& interval) {
+            return "<MuteAlarm><EventTimecardIDList>" + ids + "</EventTimecardIDList><Mute>" +
+                   mute + "</Mute><MuteInterval>" + interval + "</MuteInterval></MuteAlarm>";
+        };
+        QTest::newRow("no ids") << QStringList() << true << 0 << message("", "true", "0");
+        QTest::newRow("unmute, duplicates kept in order")
+            << QStringList{"b", "a", "b"} << false << -1
+            << message("<ID>b</ID><ID>a</ID><ID>b</ID>", "false", "-1");
+        QTest::newRow("extreme intervals")
+            << QStringList{"1"} << true << std::numeric_limits<int>::min()
+            << message("<ID>1</ID>", "true", "-2147483648");
+        QTest::newRow("markers inserted once") << QStringList{"%1", "%2%3"} << true << 30
+                                               << message("<ID>%1</ID><ID>%2%3</ID>", "true", "30");
+        QTest::newRow("escaped") << QStringList{"</ID><Evil/>&"} << false << 2147483647
+                                 << message("<ID>&lt;/ID&gt;&lt;Evil/&gt;&amp;</ID>", "false",
+                                            "2147483647");
+    }
+
+    void muteMessage()
+    {
+        QFETCH(QStringList, ids);
+        QFETCH(bool, mute);
+        QFETCH(int, interval);
+        QFETCH(QString, expected);
+        const QString message = composer.composeMuteAlarmMessage(ids, mute, interval);
+        QCOMPARE(message, expected);
+        QVERIFY(isWellFormed(message));
+    }
+
+    // Whatever a value holds, every command stays well-formed, keeps its shape and reads the
+    // value back (less the characters XML cannot carry).
+    void hostileValues_data()
+    {
+        QTest::addColumn<QString>("value");
+        QTest::addColumn<QString>("readBack");
+        const QStringList markup{"\"",        "'",      "<",           ">",   "&",
+                                 "&amp;",     "</x>",   "\"/><E a=\"", "]]>", "<!--",
+                                 "<![CDATA[", "<?pi?>", "%1%2%3",      "&#1;"};
+        for (const QString& value : markup) {
+            QTest::newRow(qPrintable(value)) << value << value;
+        }
+        QTest::newRow("control character") << QStringLiteral("a\x01z") << "az";
+        QTest::newRow("unpaired surrogate") << QString(QChar(0xD800)) + "z"
+                                            << "z";
+        QTest::newRow("noncharacter") << QStringLiteral("a\uFFFE") << "a";
+    }
+
+    void hostileValues()
+    {
+        QFETCH(QString, value);
+        QFETCH(QString, readBack);
+        const QString plain = QStringLiteral("v");
+        const auto commands = [this](const QString& v) {
+            return QStringList{composer.composeProcessAlarmMessage({v}, {{ARG_ALARM_STATUS, v}}, v),
+                               composer.composeGetAlarmInfoMessage(v),
+                               composer.composeMuteAlarmMessage({v}, true, 1),
+                               composer.composeQueryAlarmListMessage(QVariantMap{
+                                   {ARG_START_TIME, v},
+                                   {ARG_END_TIME, v},
+                                   {ARG_RULES, QVariantList{rule(1, {v}), rule(0, {v})}}})};
+        };
+        const QStringList expectedShapes = commands(plain);
+        const QStringList messages = commands(value);
+        for (qsizetype i = 0; i < messages.size(); ++i) {
+            QVERIFY2(isWellFormed(messages.at(i)), qPrintable(messages.at(i)));
+            QCOMPARE(structureOf(parsed(messages.at(i))),
+                     structureOf(parsed(expectedShapes.at(i))));
+        }
+
+        const QDomElement process = parsed(messages.at(0));
+        QCOMPARE(process.firstChildElement().firstChildElement().attribute("ID"), readBack);
+        QCOMPARE(textAt(process, "State"), readBack);
+        QCOMPARE(textAt(process, "Note"), readBack);
+        QCOMPARE(textAt(parsed(messages.at(1)), "AlarmID"), readBack);
+        QCOMPARE(textAt(parsed(messages.at(2)), "ID"), readBack);
+        const QDomElement query = parsed(messages.at(3));
+        QCOMPARE(textAt(query, "StartTm"), readBack);
+        QCOMPARE(textAt(query, "EndTm"), readBack);
+        QCOMPARE(textAt(query, "DeviceName"), readBack);
+    }
+
+    void systemTimeZone_data()
+    {
+        QTest::addColumn<QByteArray>("zone");
+        QTest::addColumn<QString>("offset");
+        QTest::newRow("UTC") << QByteArray("UTC") << "+00:00";
+        // Zones without daylight saving time, so the offset does not depend on the date.
+        QTest::newRow("Kathmandu") << QByteArray("Asia/Kathmandu") << "+05:45";
+        QTest::newRow("Marquesas") << QByteArray("Pacific/Marquesas") << "-09:30";
+    }
+
+    void systemTimeZone()
+    {
+        QFETCH(QByteArray, zone);
+        QFETCH(QString, offset);
+        if (!QTimeZone::isTimeZoneIdAvailable(zone)) {
+            QSKIP("time zone data not installed");
+        }
+        qputenv("TZ", zone);
+        const QString result = composer.getSystemTimeZone();
+        qputenv("TZ", "UTC");
+        QCOMPARE(result, offset);
+    }
+};
+
+QTEST_GUILESS_MAIN(TestMessageComposer)
+#include "tst_messagecomposer.moc"

@@ -1,0 +1,490 @@
+#include "support/FakeHost.h"
+
+#include <MessageComposer.h>
+#include <ORVOSrvTunnelControl.h>
+#include <PluginAlarmSearchCommon.h>
+#include <PluginAlarmSearchSrv.h>
+#include <RequestSenderInfo.h>
+
+#include <QtTest>
+
+#include <memory>
+#include <thread>
+
+using namespace PluginAlarmSearchCommon;
+
+Q_DECLARE_METATYPE(HDLR_DO_REQUEST_CB)
+
+namespace {
+
+const QString pluginId = QStringLiteral("C758778662E44060AC6E2EC5C9AD349B");
+Qt::HANDLE const clientHandle = reinterpret_cast<Qt::HANDLE>(0xC11E);
+
+RequestSenderInfo senderInfo()
+{
+    RequestSenderInfo info;
+    info.clientHandle = clientHandle;
+    return info;
+}
+
+// A started plug-in with its fake host.
+struct Fixture
+{
+    FakeHost host;
+    std::unique_ptr<PluginAlarmSearchSrv> plugin = std::make_unique<PluginAlarmSearchSrv>();
+
+    explicit Fixture(bool start = true)
+    {
+        if (start)
+            plugin->InitialPluginBase(&host);
+    }
+
+    void request(const QString& method, const QVariantMap& args)
+    {
+        plugin->Request(method, args, senderInfo(), host.answerSink());
+    }
+
+    void subscribe(const QString& key)
+    {
+        UntouchedResponser responser;
+        plugin->SubscribeEventBlock(key, EVENT_ALARM_UPDATED, QVariant(), senderInfo(), responser);
+        QCOMPARE(responser.calls, 0);
+    }
+
+    void unsubscribe(const QString& key)
+    {
+        UntouchedResponser responser;
+        plugin->UnsubscribeEventBlock(key, QVariant(), responser);
+    }
+};
+
+const QString processReply =
+    QStringLiteral("<ProcessAlarmRes><Result><AlarmID>A1</AlarmID><Code>0</Code></Result>"
+                   "<Result><AlarmID>A2</AlarmID><Code>1</Code></Result></ProcessAlarmRes>");
+
+} // namespace
+
+class TestPlugin : public QObject
+{
+    Q_OBJECT
+
+private slots:
+    void dispatch_data()
+    {
+        QTest::addColumn<QString>("method");
+        QTest::addColumn<QString>("command"); // empty: nothing is sent
+        QTest::newRow("QryUnhandledAlarm") << "QryUnhandledAlarm"
+                                           << "QryAlarmList";
+        QTest::newRow("QryAlarmList") << "QryAlarmList"
+                                      << "QryAlarmList";
+        QTest::newRow("GetAlarmHistory") << "GetAlarmHistory"
+                                         << "GetAlarmInfo";
+        QTest::newRow("GetAlarmHistoryForExport") << "GetAlarmHistoryForExport"
+                                                  << "GetAlarmInfo";
+        QTest::newRow("UpdateAlarm") << "UpdateAlarm"
+                                     << "ProcessAlarm";
+        QTest::newRow("MuteAlarm") << "MuteAlarm"
+                                   << "MuteAlarm";
+        QTest::newRow("lower case") << "qryalarmlist" << QString();
+        QTest::newRow("ProcessAlarm") << "ProcessAlarm" << QString();
+        QTest::newRow("GetAlarmInfo") << "GetAlarmInfo" << QString();
+        QTest::newRow("empty") << QString() << QString();
+    }
+
+    void dispatch()
+    {
+        QFETCH(QString, method);
+        QFETCH(QString, command);
+        Fixture f;
+        const QVariantMap args{{ARG_ALARM_ID, "A1"}, {ARG_ALARM_ID_LIST, QStringList{"A1"}}};
+        f.request(method, args);
+        const QList<FakeTunnelClient::Record> records = f.host.tunnel.records();
+        if (command.isEmpty()) {
+            QVERIFY(records.isEmpty());
+        } else {
+            QCOMPARE(records.size(), 1);
+            QCOMPARE(records.first().method, command);
+            QCOMPARE(records.first().clientID, clientHandle);
+        }
+        QVERIFY(f.host.answers().isEmpty()); // nothing is answered before a reply arrives
+    }
+
+    void methodPairsSendTheSameCommand_data()
+    {
+        QTest::addColumn<QString>("first");
+        QTest::addColumn<QString>("second");
+        QTest::newRow("queries") << "QryUnhandledAlarm"
+                                 << "QryAlarmList";
+        QTest::newRow("history") << "GetAlarmHistory"
+                                 << "GetAlarmHistoryForExport";
+    }
+
+    void methodPairsSendTheSameCommand()
+    {
+        QFETCH(QString, first);
+        QFETCH(QString, second);
+        const QVariantMap args{{ARG_STATE_FILTER, "<AlarmStateList><State>Unhandled</State>"
+                                                  "</AlarmStateList>"},
+                               {ARG_START_TIME, "2026-11-01T00:00:00"},
+                               {ARG_ALARM_ID, "A7"},
+                               {ARG_RELAY_PATH, "relay/1"}};
+        Fixture f;
+        f.request(first, args);
+        f.request(second, args);
+        const QList<FakeTunnelClient::Record> records = f.host.tunnel.records();
+        QCOMPARE(records.size(), 2);
+        QCOMPARE(records.at(0).commandText, records.at(1).commandText);
+        QCOMPARE(records.at(0).relayPath, QStringLiteral("relay/1"));
+        QCOMPARE(records.at(1).relayPath, QStringLiteral("relay/1"));
+    }
+
+    void queryAnswers()
+    {
+        Fixture f;
+        f.request(METHOD_QUERY_ALARM_LIST, {{ARG_RELAY_PATH, "relay/q"}});
+        f.host.tunnel.replyOnThread(
+            {true, "relay/t", "0",
+             "<QryAlarmListRes><Alarm><AlarmID>A1</AlarmID></Alarm></QryAlarmListRes>", false});
+        f.host.tunnel.replyOnThread({true, "relay/t", "80000001", "", true});
+
+        const QList<FakeHost::Answer> answers = f.host.answers();
+        QCOMPARE(answers.size(), 2);
+        QCOMPARE(answers.at(0).isLast, false);
+        QCOMPARE(answers.at(0).resultCode, QStringLiteral("0"));
+        QCOMPARE(answers.at(0).message, QString());
+        const QVariantMap ok = answers.at(0).result.toMap();
+        QCOMPARE(ok.keys(), (QStringList{"queryResult", "relayPath"}));
+        QCOMPARE(ok.value("relayPath").toString(), QStringLiteral("relay/t"));
+        QCOMPARE(ok.value("queryResult").toList().size(), 1);
+        QCOMPARE(ok.value("queryResult").toList().first().toMap().value("AlarmID").toString(),
+                 QStringLiteral("A1"));
+
+        // A failed reply has the same shape; the status text and the empty list tell it apart.
+        QCOMPARE(answers.at(1).isLast, true);
+        QCOMPARE(answers.at(1).resultCode, QStringLiteral("80000001"));
+        QCOMPARE(answers.at(1).result.toMap(),
+                 (QVariantMap{{"queryResult", QVariantList()}, {"relayPath", "relay/t"}}));
+    }
+
+    void unreadableQueryReplyKeepsTheGoodStatus()
+    {
+        Fixture f;
+        f.request(METHOD_QUERY_UNHANDLED_ALARM, {});
+        f.host.tunnel.reply({true, "r", "0", "<broken", true});
+        QCOMPARE(f.host.answers().size(), 1);
+        QCOMPARE(f.host.answers().first().resultCode, QStringLiteral("0"));
+        QCOMPARE(f.host.answers().first().result.toMap().value("queryResult").toList(),
+                 QVariantList());
+    }
+
+    // A request the tunnel refuses, or that finds no tunnel control (before start-up, or with a
+    // null tunnel client from the host), is answered at once as not sent.
+    void notSent_data()
+    {
+        QTest::addColumn<QString>("method");
+        QTest::addColumn<int>("situation");
+        const QStringList methods{"QryAlarmList", "UpdateAlarm", "GetAlarmHistory"};
+        const QStringList situations{"refused", "not started", "null tunnel client"};
+        for (const QString& m : methods)
+            for (int s = 0; s < situations.size(); ++s)
+                QTest::addRow("%s, %s", qPrintable(m), qPrintable(situations.at(s))) << m << s;
+    }
+
+    void notSent()
+    {
+        QFETCH(QString, method);
+        QFETCH(int, situation);
+        Fixture f(false);
+        if (situation == 0)
+            f.host.tunnel.setAccept(false);
+        if (situation == 2)
+            f.host.tunnelClient = nullptr;
+        if (situation != 1)
+            QVERIFY(f.plugin->InitialPluginBase(&f.host));
+        f.subscribe("key");
+
+        f.request(method, {{ARG_ALARM_ID_LIST, QStringList{"A1"}}, {ARG_RELAY_PATH, "r"}});
+        const QList<FakeHost::Answer> answers = f.host.answers();
+        QCOMPARE(answers.size(), 1);
+        QCOMPARE(answers.first().isLast, true);
+        QCOMPARE(answers.first().resultCode, QStringLiteral("-1"));
+        QCOMPARE(answers.first().message, QString());
+        QVERIFY(answers.first().result.isNull());
+        QVERIFY(f.host.events().isEmpty());
+
+        f.request(METHOD_MUTE_ALARM, {{ARG_ALARM_ID_LIST, QStringList{"A1"}}});
+        QCOMPARE(f.host.answers().size(), 1);
+    }
+
+    void updateSendsTheProcessingCommand()
+    {
+        Fixture f;
+        f.request(METHOD_UPDATE_ALARM, {{ARG_ALARM_ID_LIST, QStringList{"A1", "A2"}},
+                                        {ARG_ALARM_STATUS, "Handled"},
+                                        {ARG_ALARM_COMMENT, "checked on site"},
+                                        {ARG_RELAY_PATH, "relay/u"}});
+        const FakeTunnelClient::Record r = f.host.tunnel.last();
+        QCOMPARE(r.commandText, QStringLiteral("<ProcessAlarm><AlarmList><Alarm ID=\"A1\"/>"
+                                               "<Alarm ID=\"A2\"/></AlarmList><Status>"
+                                               "<State>Handled</State></Status><Note>checked on "
+                                               "site</Note></ProcessAlarm>"));
+        QCOMPARE(r.relayPath, QStringLiteral("relay/u"));
+        QCOMPARE(r.kind, 4);
+    }
+
+    void updatePublishesBeforeAnswering()
+    {
+        Fixture f;
+        f.subscribe("k1");
+        f.subscribe("k2");
+        f.request(METHOD_UPDATE_ALARM, {{ARG_ALARM_ID_LIST, QStringList{"A1", "A2"}},
+                                        {ARG_ALARM_STATUS, "Handled"},
+                                        {ARG_RELAY_PATH, "relay/request"}});
+        f.host.tunnel.replyOnThread({true, "relay/tunnel", "0", processReply, false});
+
+        QCOMPARE(f.host.journal(), (QStringList{"event k1", "event k2", "answer 0"}));
+        const FakeHost::Answer answer = f.host.answers().first();
+        QCOMPARE(answer.isLast, false);
+        QCOMPARE(answer.message, QString());
+        QVERIFY(answer.result.isNull());
+
+        const QVariantMap expected{
+            {"alarmUpdatedResults",
+             QVariantList{
+                 QVariantMap{{"alarmId", "A1"}, {"alarmStatus", "Handled"}, {"updateResult", "0"}},
+                 QVariantMap{
+                     {"alarmId", "A2"}, {"alarmStatus", "Handled"}, {"updateResult", "1"}}}},
+            {"relayPath", "relay/request"}};
+        const QList<FakeHost::Event> events = f.host.events();
+        QCOMPARE(events.size(), 2);
+        for (const FakeHost::Event& e : events) {
+            QCOMPARE(e.pluginId, pluginId);
+            QCOMPARE(e.eventName, QStringLiteral("AlarmUpdated"));
+            QCOMPARE(e.eventData.toMap(), expected);
+            QVERIFY(e.eventTime > 0);
+        }
+        QCOMPARE(events.at(0).subscriptionKey, QStringLiteral("k1"));
+        QCOMPARE(events.at(1).subscriptionKey, QStringLiteral("k2"));
+    }
+
+    void updateWithNoResultsStillPublishes()
+    {
+        Fixture f;
+        f.subscribe("k");
+        f.request(METHOD_UPDATE_ALARM, {});
+        f.host.tunnel.reply({true, "", "0", "<ProcessAlarmRes/>", true});
+        QCOMPARE(f.host.events().size(), 1);
+        QCOMPARE(f.host.events().first().eventData.toMap().value("alarmUpdatedResults").toList(),
+                 QVariantList());
+        QCOMPARE(f.host.answers().first().resultCode, QStringLiteral("0"));
+    }
+
+    void failedUpdateReply()
+    {
+        Fixture f;
+        f.subscribe("k");
+        f.request(METHOD_UPDATE_ALARM,
+                  {{ARG_ALARM_ID_LIST, QStringList{"A1"}}, {ARG_RELAY_PATH, "relay/request"}});
+        f.host.tunnel.reply({true, "relay/tunnel", "80000000", processReply, false});
+        QVERIFY(f.host.events().isEmpty());
+        const FakeHost::Answer answer = f.host.answers().first();
+        QCOMPARE(answer.isLast, false);
+        QCOMPARE(answer.resultCode, QStringLiteral("-1"));
+        QCOMPARE(answer.result.toMap(),
+                 (QVariantMap{{"alarmIdList", QStringList{"A1"}}, {"relayPath", "relay/request"}}));
+    }
+
+    void historyAnswers()
+    {
+        Fixture f;
+        f.request(METHOD_GET_ALARM_HISTORY, {{ARG_ALARM_ID, "A9"}, {ARG_RELAY_PATH, "relay/h"}});
+        const FakeTunnelClient::Record r = f.host.tunnel.last();
+        QCOMPARE(r.commandText,
+                 QStringLiteral("<GetAlarmInfo><AlarmID>A9</AlarmID></GetAlarmInfo>"));
+        QCOMPARE(r.relayPath, QStringLiteral("relay/h"));
+
+        f.host.tunnel.replyOnThread(
+            {true, "x", "0",
+             "<GetAlarmInfoRes><Alarm><ChangeLogs><Entry><State>New</State></Entry>"
+             "<Entry><State>Handled</State></Entry></ChangeLogs></Alarm></GetAlarmInfoRes>",
+             false});
+        f.host.tunnel.replyOnThread({false, "x", "0", "", true});
+
+        const QList<FakeHost::Answer> answers = f.host.answers();
+        QCOMPARE(answers.size(), 2);
+        QCOMPARE(answers.at(0).resultCode, QStringLiteral("0"));
+        QCOMPARE(answers.at(0).isLast, false);
+        QCOMPARE(answers.at(0).result.toList(),
+                 (QVariantList{QVariantMap{{"State", "New"}}, QVariantMap{{"State", "Handled"}}}));
+        QCOMPARE(answers.at(1).resultCode, QStringLiteral("-1"));
+        QCOMPARE(answers.at(1).isLast, true);
+        QVERIFY(!answers.at(1).result.isValid());
+    }
+
+    void muteValues_data()
+    {
+        QTest::addColumn<QVariantMap>("args");
+        QTest::addColumn<QString>("command");
+        QTest::newRow("ids only")
+            << QVariantMap{{ARG_ALARM_ID_LIST, QStringList{"A1"}}}
+            << "<MuteAlarm><EventTimecardIDList><ID>A1</ID></EventTimecardIDList><Mute>false</Mute>"
+               "<MuteInterval>0</MuteInterval></MuteAlarm>";
+        QTest::newRow("digits as text")
+            << QVariantMap{{ARG_ALARM_ID_LIST, QStringList{"A1", "A2"}},
+                           {ARG_IS_MUTE, true},
+                           {ARG_MUTE_TIME_SECOND, "15"}}
+            << "<MuteAlarm><EventTimecardIDList><ID>A1</ID><ID>A2</ID></EventTimecardIDList>"
+               "<Mute>true</Mute><MuteInterval>15</MuteInterval></MuteAlarm>";
+        QTest::newRow("no number")
+            << QVariantMap{{ARG_IS_MUTE, true}, {ARG_MUTE_TIME_SECOND, "soon"}}
+            << "<MuteAlarm><EventTimecardIDList></EventTimecardIDList><Mute>true</Mute>"
+               "<MuteInterval>0</MuteInterval></MuteAlarm>";
+    }
+
+    void muteValues()
+    {
+        QFETCH(QVariantMap, args);
+        QFETCH(QString, command);
+        Fixture f;
+        f.request(METHOD_MUTE_ALARM, args);
+        const FakeTunnelClient::Record r = f.host.tunnel.last();
+        QCOMPARE(r.kind, 2);
+        QCOMPARE(r.commandText, command);
+        QCOMPARE(r.relayPath, QString());
+        QVERIFY(!r.replyCallback);
+        QVERIFY(f.host.answers().isEmpty());
+    }
+
+    void subscriptions()
+    {
+        Fixture f;
+        f.subscribe("a");
+        f.subscribe("b");
+        f.subscribe("a");
+        f.subscribe("A");
+        f.unsubscribe("missing");
+        f.plugin->emitEventSignal("E", 1);
+        QStringList keys;
+        for (const FakeHost::Event& e : f.host.events())
+            keys << e.subscriptionKey;
+        QCOMPARE(keys, (QStringList{"a", "b", "A"}));
+
+        f.unsubscribe("a");
+        f.unsubscribe("b");
+        f.unsubscribe("A");
+        f.plugin->emitEventSignal("E", 1);
+        QCOMPARE(f.host.events().size(), 3);
+    }
+
+    void nullEventDataStaysNull()
+    {
+        Fixture f;
+        f.subscribe("k");
+        f.plugin->emitEventSignal("E", QVariant());
+        QVERIFY(f.host.events().first().eventData.isNull());
+    }
+
+    void publishingWithoutAHostCallbackCallsNothing()
+    {
+        Fixture notStarted(false);
+        notStarted.subscribe("k");
+        notStarted.plugin->emitEventSignal("E", 1); // must not call an empty callback
+
+        Fixture emptyCallback(false);
+        emptyCallback.host.eventSignal = nullptr;
+        emptyCallback.plugin->InitialPluginBase(&emptyCallback.host);
+        emptyCallback.subscribe("k");
+        emptyCallback.request(METHOD_UPDATE_ALARM, {});
+        emptyCallback.host.tunnel.reply({true, "", "0", processReply, true});
+        QCOMPARE(emptyCallback.host.answers().size(), 1);
+    }
+
+    void startUp()
+    {
+        // An installed tunnel control is kept; the host's tunnel client is not asked for.
+        FakeHost host;
+        FakeTunnelClient own;
+        PluginAlarmSearchSrv plugin;
+        plugin.setORVOSrvTunnelCtrl(QSharedPointer<ORVOSrvTunnelControl>::create(&own));
+        QVERIFY(plugin.InitialPluginBase(&host));
+        QCOMPARE(host.tunnelClientAsked, 0);
+        plugin.Request(METHOD_GET_ALARM_HISTORY, QVariantMap(), senderInfo(), host.answerSink());
+        QCOMPARE(own.records().size(), 1);
+        QVERIFY(host.tunnel.records().isEmpty());
+
+        // A second start-up replaces the event callback and keeps the control.
+        FakeHost second;
+        QVERIFY(plugin.InitialPluginBase(&second));
+        QCOMPARE(second.tunnelClientAsked, 0);
+        UntouchedResponser responser;
+        plugin.SubscribeEventBlock("k", QString(), QVariant(), senderInfo(), responser);
+        plugin.emitEventSignal("E", 1);
+        QVERIFY(host.events().isEmpty());
+        QCOMPARE(second.events().size(), 1);
+    }
+
+    void requestBlockServesNothing()
+    {
+        Fixture f;
+        UntouchedResponser responser;
+        f.plugin->RequestBlock(METHOD_QUERY_ALARM_LIST, QVariantMap(), senderInfo(), responser);
+        QCOMPARE(responser.calls, 0);
+        QVERIFY(f.host.tunnel.records().isEmpty());
+    }
+
+    // A reply that arrives after the plug-in was deleted reaches neither the plug-in nor the
+    // client: no answer, no event.
+    void updateReplyAfterDeletion()
+    {
+        Fixture f;
+        f.subscribe("k");
+        f.request(METHOD_UPDATE_ALARM, {{ARG_ALARM_ID_LIST, QStringList{"A1"}}});
+        f.request(METHOD_QUERY_ALARM_LIST, {});
+        const QList<FakeTunnelClient::Record> pending = f.host.tunnel.records();
+        f.plugin.reset();
+        std::thread([&] {
+            for (const FakeTunnelClient::Record& r : pending)
+                FakeTunnelClient::deliver(r, {true, "", "0", processReply, true});
+        }).join();
+        QVERIFY(f.host.events().isEmpty());
+        // The query completion holds nothing of the plug-in and still answers its client.
+        QCOMPARE(f.host.journal(), QStringList{"answer 0"});
+    }
+
+    void metaObject()
+    {
+        PluginAlarmSearchSrv plugin;
+        const QMetaObject* mo = plugin.metaObject();
+        QCOMPARE(mo->className(), "PluginAlarmSearchSrv");
+        QCOMPARE(mo->superClass(), &QObject::staticMetaObject);
+        QCOMPARE(mo->methodCount() - mo->methodOffset(), 1);
+        QCOMPARE(mo->propertyCount() - mo->propertyOffset(), 0);
+        const QMetaMethod method = mo->method(mo->methodOffset());
+        QCOMPARE(method.methodSignature(),
+                 QByteArray("handleQueryAlarm(Qt::HANDLE,QVariant,HDLR_DO_REQUEST_CB)"));
+        QCOMPARE(method.methodType(), QMetaMethod::Method);
+        QCOMPARE(method.access(), QMetaMethod::Public);
+        QCOMPARE(method.parameterNames(), (QList<QByteArray>{"clientID", "reqData", "reqCB"}));
+
+        QCOMPARE(qobject_cast<IPluginObjectBase*>(&plugin), &plugin);
+        QCOMPARE(plugin.qt_metacast("PluginAlarmSearchSrv"), static_cast<void*>(&plugin));
+        QCOMPARE(plugin.qt_metacast("com.KELMARO.PluginServer.PluginInterface"),
+                 static_cast<void*>(static_cast<IPluginObjectBase*>(&plugin)));
+        QCOMPARE(plugin.qt_metacast("Other"), nullptr);
+    }
+
+    void invokableQueryThroughTheMetaObject()
+    {
+        Fixture f;
+        const HDLR_DO_REQUEST_CB callback = f.host.answerSink();
+        const QVariant args = QVariantMap{{ARG_RELAY_PATH, "relay/m"}};
+        QVERIFY(QMetaObject::invokeMethod(f.plugin.get(), "handleQueryAlarm", Qt::DirectConnection,
+                                          Q_ARG(Qt::HANDLE, clientHandle), Q_ARG(QVariant, args),
+                                          Q_ARG(HDLR_DO_REQUEST_CB, callback)));
+        QCOMPARE(f.host.tunnel.last().relayPath, QStringLiteral("relay/m"));
+        QCOMPARE(f.host.tunnel.last().clientID, clientHandle);
+    }
+};
+
+QTEST_GUILESS_MAIN(TestPlugin)
+#include "tst_plugin.moc"

@@ -1,0 +1,276 @@
+#include <XML2Json.h>
+
+#include <QtTest>
+
+namespace {
+
+using Map = QVariantMap;
+using List = QVariantList;
+
+QString nested(int depth)
+{
+    return QString(QStringLiteral("<e>")).repeated(depth) +
+           QString(QStringLiteral("</e>")).repeated(depth);
+}
+
+// Depth of the rendering of nested(n): the innermost element renders as text.
+int depthOf(QVariant value)
+{
+    int depth = 0;
+    while (value.userType() == QMetaType::QVariantMap) {
+        value = value.toMap().value(QStringLiteral("e"));
+        ++depth;
+    }
+    return value.userType() == QMetaType::QString ? depth : -1;
+}
+
+} // namespace
+
+class TestXml2Json : public QObject
+{
+    Q_OBJECT
+
+private slots:
+    void rendering_data()
+    {
+        QTest::addColumn<QString>("xml");
+        QTest::addColumn<QVariant>("expected");
+
+        QTest::newRow("leaf text") << "<R>abc</R>" << QVariant(Map{{"R", "abc"}});
+        QTest::newRow("empty element") << "<R/>" << QVariant(Map{{"R", ""}});
+        QTest::newRow("whitespace around root") << "\n <?xml-stylesheet x?> <R>a</R>\n <!--c-->\n"
+                                                << QVariant(Map{{"R", "a"}});
+        QTest::newRow("empty pair") << "<R></R>" << QVariant(Map{{"R", ""}});
+        QTest::newRow("leaf keeps whitespace")
+            << "<R>  a b \n</R>" << QVariant(Map{{"R", "  a b \n"}});
+        QTest::newRow("whitespace-only leaf") << "<R> </R>" << QVariant(Map{{"R", " "}});
+        QTest::newRow("example") << "<R><A>1</A><A>2</A><B x=\"y\">t</B><C/></R>"
+                                 << QVariant(Map{{"R", Map{{"A", List{"1", "2"}},
+                                                           {"B", Map{{"@x", "y"}, {"#text", "t"}}},
+                                                           {"C", ""}}}});
+        QTest::newRow("attributes only")
+            << "<R a='1' b=\"two\"/>" << QVariant(Map{{"R", Map{{"@a", "1"}, {"@b", "two"}}}});
+        QTest::newRow("attribute and child of one name")
+            << "<R A='x'><A>y</A></R>" << QVariant(Map{{"R", Map{{"@A", "x"}, {"A", "y"}}}});
+        QTest::newRow("repeated names keep document order")
+            << "<R><A>3</A><B>b</B><A>1</A><A>2</A></R>"
+            << QVariant(Map{{"R", Map{{"A", List{"3", "1", "2"}}, {"B", "b"}}}});
+        QTest::newRow("repeated maps and texts mixed")
+            << "<R><A k='1'/><A>t</A><A><x>1</x></A></R>"
+            << QVariant(Map{{"R", Map{{"A", List{Map{{"@k", "1"}}, "t", Map{{"x", "1"}}}}}}});
+        QTest::newRow("mixed text")
+            << "<R>a<B>b</B>c <C/> d</R>"
+            << QVariant(Map{{"R", Map{{"B", "b"}, {"C", ""}, {"#text", "ac  d"}}}});
+        QTest::newRow("whitespace between children ignored")
+            << "<R>\n  <A>1</A>\n  <B> </B>\n</R>"
+            << QVariant(Map{{"R", Map{{"A", "1"}, {"B", " "}}}});
+        QTest::newRow("whitespace text with attribute ignored")
+            << "<R a='1'>\n </R>" << QVariant(Map{{"R", Map{{"@a", "1"}}}});
+        QTest::newRow("CDATA is text")
+            << "<R><A><![CDATA[<b>&amp;</b>]]></A><B>x<![CDATA[y]]>z</B></R>"
+            << QVariant(Map{{"R", Map{{"A", "<b>&amp;</b>"}, {"B", "xyz"}}}});
+        QTest::newRow("CDATA in mixed text")
+            << "<R k='v'>a<![CDATA[ b ]]></R>"
+            << QVariant(Map{{"R", Map{{"@k", "v"}, {"#text", "a b "}}}});
+        QTest::newRow("comments and PIs skipped")
+            << "<?xml version='1.0'?><!--c--><R><!--c--><A>1<!--c-->2</A><?pi x?><B/></R><!--c-->"
+            << QVariant(Map{{"R", Map{{"A", "12"}, {"B", ""}}}});
+        QTest::newRow("comment-only element is empty")
+            << "<R><!-- nothing --></R>" << QVariant(Map{{"R", ""}});
+        QTest::newRow("nested maps")
+            << "<R><A><B><C>deep</C><D/></B></A></R>"
+            << QVariant(Map{{"R", Map{{"A", Map{{"B", Map{{"C", "deep"}, {"D", ""}}}}}}}});
+        QTest::newRow("entities and character references")
+            << "<R a='&lt;&quot;&#x41;'><T>&amp;&lt;&gt;&apos;&quot; &#65;&#x263A;</T></R>"
+            << QVariant(
+                   Map{{"R", Map{{"@a", "<\"A"}, {"T", QString::fromUtf8("&<>'\" A\u263A")}}}});
+        QTest::newRow("qualified names as written")
+            << "<p:R xmlns:p='urn:x'><p:A>1</p:A><A>2</A></p:R>"
+            << QVariant(Map{{"p:R", Map{{"@xmlns:p", "urn:x"}, {"p:A", "1"}, {"A", "2"}}}});
+        QTest::newRow("non-ASCII text")
+            << QString::fromUtf8("<R><N>Kamera Süd 東</N></R>")
+            << QVariant(Map{{"R", Map{{"N", QString::fromUtf8("Kamera Süd 東")}}}});
+    }
+
+    void rendering()
+    {
+        QFETCH(QString, xml);
+        QFETCH(QVariant, expected);
+        XML2Json converter;
+        const QVariant result = converter.parse(xml);
+        QCOMPARE(result, expected);
+        QCOMPARE(converter.errorString(), QString());
+    }
+
+    void emptyTextIsNotNull()
+    {
+        const QVariant root = XML2Json().parse(QStringLiteral("<R><A/></R>")).toMap().value("R");
+        const QVariant empty = root.toMap().value(QStringLiteral("A"));
+        QCOMPARE(empty.userType(), QMetaType::QString);
+        QVERIFY(!empty.toString().isNull());
+    }
+
+    void replyShapes_data()
+    {
+        QTest::addColumn<QString>("xml");
+        QTest::addColumn<QStringList>("path");
+        QTest::addColumn<QString>("item");
+        QTest::addColumn<QVariantList>("expected");
+
+        const QStringList alarmPath{"QryAlarmListRes", "Alarm"};
+        const Map alarm1{{"AlarmID", "1"}, {"Name", "Door"}, {"State", "0"}};
+        const Map alarm2{{"AlarmID", "2"}, {"Name", "Gate"}, {"State", "1"}};
+        const Map alarm3{{"AlarmID", "3"}, {"Name", ""}, {"State", "2"}};
+        QTest::newRow("no alarm") << "<QryAlarmListRes><Total>0</Total></QryAlarmListRes>"
+                                  << alarmPath << "Alarm" << List{};
+        QTest::newRow("empty reply element")
+            << "<QryAlarmListRes/>" << alarmPath << "Alarm" << List{};
+        QTest::newRow("one alarm")
+            << "<QryAlarmListRes><Total>1</Total><Alarm><AlarmID>1</AlarmID><Name>Door</Name>"
+               "<State>0</State></Alarm></QryAlarmListRes>"
+            << alarmPath << "Alarm" << List{alarm1};
+        QTest::newRow("three alarms")
+            << "<QryAlarmListRes>\n<Alarm><AlarmID>1</AlarmID><Name>Door</Name><State>0</State>"
+               "</Alarm>\n<Total>3</Total>\n<Alarm><AlarmID>2</AlarmID><Name>Gate</Name><State>1"
+               "</State></Alarm>\n<Alarm><AlarmID>3</AlarmID><Name/><State>2</State></Alarm>\n"
+               "</QryAlarmListRes>"
+            << alarmPath << "Alarm" << List{alarm1, alarm2, alarm3};
+        QTest::newRow("process results")
+            << "<ProcessAlarmRes><Result><AlarmID>7</AlarmID><Code>0</Code></Result>"
+               "<Result><AlarmID>8</AlarmID><Code>-5</Code><Extra>x</Extra></Result>"
+               "</ProcessAlarmRes>"
+            << QStringList{"ProcessAlarmRes", "Result"} << "Result"
+            << List{Map{{"AlarmID", "7"}, {"Code", "0"}},
+                    Map{{"AlarmID", "8"}, {"Code", "-5"}, {"Extra", "x"}}};
+        QTest::newRow("process result without code")
+            << "<ProcessAlarmRes><Result><AlarmID>7</AlarmID></Result></ProcessAlarmRes>"
+            << QStringList{"ProcessAlarmRes", "Result"} << "Result" << List{Map{{"AlarmID", "7"}}};
+        const QStringList entryPath{"GetAlarmInfoRes", "Alarm", "ChangeLogs", "Entry"};
+        QTest::newRow("change log entries")
+            << "<GetAlarmInfoRes><Alarm><AlarmID>9</AlarmID><ChangeLogs>"
+               "<Entry><Time>1</Time><User>a</User></Entry>"
+               "<Entry><Time>2</Time><Note>n &amp; m</Note></Entry>"
+               "<Entry><Time>3</Time></Entry></ChangeLogs></Alarm></GetAlarmInfoRes>"
+            << entryPath << "Entry"
+            << List{Map{{"Time", "1"}, {"User", "a"}}, Map{{"Time", "2"}, {"Note", "n & m"}},
+                    Map{{"Time", "3"}}};
+        QTest::newRow("one change log entry")
+            << "<GetAlarmInfoRes><Alarm><ChangeLogs><Entry><Time>1</Time></Entry></ChangeLogs>"
+               "</Alarm></GetAlarmInfoRes>"
+            << entryPath << "Entry" << List{Map{{"Time", "1"}}};
+        QTest::newRow("no change logs")
+            << "<GetAlarmInfoRes><Alarm><AlarmID>9</AlarmID></Alarm></GetAlarmInfoRes>" << entryPath
+            << "Entry" << List{};
+    }
+
+    // Descends as the reply readers do: maps down to the item's parent, then the item as list.
+    void replyShapes()
+    {
+        QFETCH(QString, xml);
+        QFETCH(QStringList, path);
+        QFETCH(QString, item);
+        QFETCH(QVariantList, expected);
+        const QVariant parsed = XML2Json().parse(xml);
+        QVERIFY(parsed.isValid());
+        QVariantMap level = parsed.toMap();
+        for (const QString& name : path.mid(0, path.size() - 1))
+            level = level.value(name).toMap();
+        QCOMPARE(XML2Json::transContentAsList(level.value(item)), expected);
+    }
+
+    void transContentAsList_data()
+    {
+        QTest::addColumn<QVariant>("value");
+        QTest::addColumn<QVariantList>("expected");
+        const Map map{{"a", "1"}};
+        QTest::newRow("list") << QVariant(List{map, "t"}) << List{map, "t"};
+        QTest::newRow("single map") << QVariant(map) << List{map};
+        QTest::newRow("single text") << QVariant("t") << List{"t"};
+        QTest::newRow("single empty text") << QVariant("") << List{""};
+        QTest::newRow("invalid") << QVariant() << List{};
+    }
+
+    void transContentAsList()
+    {
+        QFETCH(QVariant, value);
+        QFETCH(QVariantList, expected);
+        QCOMPARE(XML2Json::transContentAsList(value), expected);
+    }
+
+    void refusals_data()
+    {
+        QTest::addColumn<QString>("xml");
+        QTest::newRow("null text") << QString();
+        QTest::newRow("empty text") << "";
+        QTest::newRow("whitespace only") << "  \n ";
+        QTest::newRow("comment only") << "<!-- c -->";
+        QTest::newRow("plain text") << "not xml";
+        QTest::newRow("mismatched tags") << "<R><A></B></R>";
+        QTest::newRow("truncated") << "<R><A>1</A>";
+        QTest::newRow("truncated tag") << "<R><A>1</A></R";
+        QTest::newRow("two roots") << "<R/><S/>";
+        QTest::newRow("text after root") << "<R/>tail";
+        QTest::newRow("duplicate attribute") << "<R a='1' a='2'/>";
+        QTest::newRow("unquoted attribute") << "<R a=1/>";
+        QTest::newRow("raw U+0001") << QStringLiteral("<R>a") + QChar(0x1) + QStringLiteral("</R>");
+        QTest::newRow("reference to U+0001") << "<R>&#1;</R>";
+        QTest::newRow("undeclared entity") << "<R>&nbsp;</R>";
+        QTest::newRow("lone ampersand") << "<R>a & b</R>";
+        QTest::newRow("DTD without entities") << "<!DOCTYPE R><R/>";
+        QTest::newRow("DTD with internal subset")
+            << "<!DOCTYPE R [<!ELEMENT R (#PCDATA)>]><R>x</R>";
+        QTest::newRow("external entity")
+            << "<!DOCTYPE R [<!ENTITY x SYSTEM 'file:///etc/passwd'>]><R>&x;</R>";
+        QTest::newRow("depth 257") << nested(XML2Json::MaxDepth + 1);
+        QTest::newRow("depth 100000") << nested(100000);
+        QTest::newRow("depth 100000 unclosed") << QString(QStringLiteral("<e>")).repeated(100000);
+    }
+
+    void refusals()
+    {
+        QFETCH(QString, xml);
+        XML2Json converter;
+        QVERIFY(converter.parse(QStringLiteral("<ok/>")).isValid());
+        const QVariant result = converter.parse(xml);
+        QVERIFY(!result.isValid());
+        QVERIFY(!converter.errorString().isEmpty());
+    }
+
+    void entityBombRefused()
+    {
+        const QString bomb = QStringLiteral("<!DOCTYPE R [<!ENTITY e \"") +
+                             QString(4000, QLatin1Char('x')) + QStringLiteral("\">]><R>") +
+                             QStringLiteral("&e;").repeated(400000) + QStringLiteral("</R>");
+        XML2Json converter;
+        QVERIFY(!converter.parse(bomb).isValid());
+        QVERIFY(converter.errorString().contains(QLatin1String("Document type")));
+    }
+
+    void depthBound()
+    {
+        const QVariant deepest = XML2Json().parse(nested(XML2Json::MaxDepth));
+        QCOMPARE(depthOf(deepest), XML2Json::MaxDepth);
+        XML2Json converter;
+        QVERIFY(!converter.parse(nested(XML2Json::MaxDepth + 1)).isValid());
+        QVERIFY(converter.errorString().contains(QLatin1String("256")));
+    }
+
+    void manyAlarms()
+    {
+        QString xml = QStringLiteral("<QryAlarmListRes>");
+        for (int i = 0; i < 5000; ++i)
+            xml += QStringLiteral("<Alarm id='%1'><AlarmID>%1</AlarmID></Alarm>").arg(i);
+        xml += QStringLiteral("</QryAlarmListRes>");
+        const QVariantMap reply =
+            XML2Json().parse(xml).toMap().value(QStringLiteral("QryAlarmListRes")).toMap();
+        const QVariantList alarms = XML2Json::transContentAsList(reply.value("Alarm"));
+        QCOMPARE(alarms.size(), 5000);
+        for (int i = 0; i < alarms.size(); ++i) {
+            const Map expected{{"@id", QString::number(i)}, {"AlarmID", QString::number(i)}};
+            QCOMPARE(alarms.at(i), QVariant(expected));
+        }
+    }
+};
+
+QTEST_GUILESS_MAIN(TestXml2Json)
+#include "tst_xml2json.moc"
