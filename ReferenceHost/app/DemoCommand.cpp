@@ -155,11 +155,12 @@ int DemoScript::run()
     const QVariantList entries = answer.result.toList();
     for (const QVariant& entry : entries) {
         const QVariantMap fields = entry.toMap();
-        say(QStringLiteral("   %1  %2  by %3: %4")
+        const QString note = fields.value(QStringLiteral("Note")).toString();
+        say(QStringLiteral("   %1  %2  by %3%4")
                 .arg(fields.value(QStringLiteral("Time")).toString(),
                      fields.value(QStringLiteral("State")).toString().leftJustified(10),
                      fields.value(QStringLiteral("User")).toString(),
-                     fields.value(QStringLiteral("Note")).toString()));
+                     note.isEmpty() ? QString() : QStringLiteral(": ") + note));
     }
 
     step(QStringLiteral("GetAlarmHistoryForExport: the same history, as an export asks for it"));
