@@ -13,6 +13,10 @@
 namespace {
 
 constexpr qsizetype MaxAttributes = 32;
+// Short texts recur from alarm to alarm (event classes, states, device names); up to this many
+// distinct ones of up to InternedLength characters are shared instead of allocated again.
+constexpr qsizetype InternedTexts = 4096;
+constexpr qsizetype InternedLength = 48;
 
 const QString ReplyName = QStringLiteral("QryAlarmListRes");
 const QString AlarmName = QStringLiteral("Alarm");
@@ -303,11 +307,24 @@ private:
         run.empty = m_pos == begin;
         if (keep && !run.empty) {
             if (run.value.isNull())
-                run.value = QStringView(plainFrom, m_pos).toString();
+                run.value = interned(QStringView(plainFrom, m_pos));
             else
                 flush();
         }
         return true;
+    }
+
+    QString interned(QStringView text)
+    {
+        if (text.size() > InternedLength)
+            return text.toString();
+        const auto it = m_texts.constFind(text);
+        if (it != m_texts.cend())
+            return *it;
+        QString copy = text.toString();
+        if (m_texts.size() < InternedTexts)
+            m_texts.insert(text, copy);
+        return copy;
     }
 
     // A quoted attribute value, its white space normalised to spaces as parsers do.
@@ -457,15 +474,15 @@ private:
             return false;
         m_attributes.clear();
         const bool isReply = elementName == ReplyName;
-        bool afterText = false;
         while (!emptyElement) {
+            // Text the DOM keeps, between two children: the alarm before it takes no line break,
+            // the alarm after it no indentation.
             TextRun run;
             if (!text(run, false))
                 return false;
-            if (!run.blank) {
-                afterText = true;
-                m_lineBreakPending = false; // the last alarm is followed by text
-            }
+            const bool afterText = !run.blank;
+            if (m_alarmPending)
+                finishAlarmText(afterText);
             if (m_pos == m_end)
                 return false;
             ++m_pos;
@@ -475,7 +492,6 @@ private:
                     return false;
                 break;
             }
-            endPendingAlarm();
             const char16_t* const childStart = m_pos;
             QStringView childName;
             const bool isAlarm = isReply && name(childName) && childName == AlarmName;
@@ -483,37 +499,35 @@ private:
             if (!element(2, isAlarm))
                 return false;
             if (isAlarm)
-                addAlarm(afterText, m_pos - childStart);
-            afterText = false;
+                addAlarm(afterText);
         }
-        endPendingAlarm();
         return true;
     }
 
-    void endPendingAlarm()
-    {
-        if (m_lineBreakPending)
-            m_alarmTexts.back().append(u'\n');
-        m_lineBreakPending = false;
-    }
-
-    // The alarm just read, sourceLength characters of the reply.
-    void addAlarm(bool afterText, qsizetype sourceLength)
+    // The alarm just read into m_nodes.
+    void addAlarm(bool afterText)
     {
         QVariant rendering = render(0);
         m_alarms.push_back(rendering.toMap());
         rendering.clear();
 
-        QString xml;
-        // Room for the source and a few levels of indentation.
-        xml.reserve(sourceLength + 64);
-        DomStyleWriter writer(xml);
+        // Written into a buffer that keeps its capacity from alarm to alarm; whether a line break
+        // ends it is known once the text after the alarm has been read.
+        m_xml.clear();
+        DomStyleWriter writer(m_xml);
         write(writer, 0, 1, afterText);
-        m_alarmTexts.push_back(std::move(xml));
-        m_lineBreakPending = true;
+        m_alarmPending = true;
 
         m_nodes.clear();
         m_attributes.clear();
+    }
+
+    // Ends the text of the alarm read last and keeps a copy of just the right size.
+    void finishAlarmText(bool beforeText)
+    {
+        DomStyleWriter(m_xml).lineBreak(beforeText);
+        m_alarmTexts.emplace_back(m_xml.constData(), m_xml.size());
+        m_alarmPending = false;
     }
 
     const QString& key(QStringView name, QHash<QStringView, QString>& cache, QStringView prefix)
@@ -616,9 +630,11 @@ private:
 
     std::vector<QVariantMap> m_alarms;
     std::vector<QString> m_alarmTexts;
-    bool m_lineBreakPending = false; // after the last alarm's text, unless text follows
+    QString m_xml;
+    bool m_alarmPending = false; // m_xml holds an alarm's text, still without its line break
     QHash<QStringView, QString> m_elementKeys;
     QHash<QStringView, QString> m_attributeKeys;
+    QHash<QStringView, QString> m_texts; // keys view the reply text
 };
 
 } // namespace

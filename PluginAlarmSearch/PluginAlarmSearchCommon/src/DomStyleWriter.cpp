@@ -1,5 +1,7 @@
 #include "DomStyleWriter.h"
 
+#include <algorithm>
+
 namespace {
 
 constexpr int IndentWidth = 4;
@@ -8,7 +10,10 @@ constexpr int IndentWidth = 4;
 
 void DomStyleWriter::indent(int level)
 {
-    m_out.append(QString(level * IndentWidth, u' '));
+    static constexpr QStringView Spaces =
+        u"                                                                ";
+    for (qsizetype missing = qsizetype(level) * IndentWidth; missing > 0; missing -= Spaces.size())
+        m_out.append(Spaces.first(std::min(missing, Spaces.size())));
 }
 
 void DomStyleWriter::openStartTag(QStringView name, int level, bool afterText)
