@@ -423,6 +423,27 @@ private slots:
         QCOMPARE(second.events().size(), 1);
     }
 
+    // Bad input from the host is survived: no framework tools, an empty client callback.
+    void badHostInput()
+    {
+        Fixture f(false);
+        QVERIFY(f.plugin->InitialPluginBase(nullptr));
+        f.request(METHOD_QUERY_ALARM_LIST, {});
+        QCOMPARE(f.host.answers().size(), 1);
+        QCOMPARE(f.host.answers().first().resultCode, QStringLiteral("-1"));
+
+        QVERIFY(f.plugin->InitialPluginBase(&f.host));
+        for (const QString& method :
+             {METHOD_QUERY_ALARM_LIST, METHOD_UPDATE_ALARM, METHOD_GET_ALARM_HISTORY}) {
+            f.plugin->Request(method, QVariantMap(), senderInfo(), HDLR_DO_REQUEST_CB());
+            f.host.tunnel.replyOnThread({true, "", "0", processReply, true});
+        }
+        QCOMPARE(f.host.tunnel.records().size(), 3);
+        f.host.tunnel.setAccept(false);
+        f.plugin->Request(METHOD_UPDATE_ALARM, QVariantMap(), senderInfo(), HDLR_DO_REQUEST_CB());
+        QCOMPARE(f.host.answers().size(), 1);
+    }
+
     void requestBlockServesNothing()
     {
         Fixture f;

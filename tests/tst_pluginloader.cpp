@@ -7,6 +7,7 @@
 #include <RequestSenderInfo.h>
 
 #include <QPluginLoader>
+#include <QTemporaryDir>
 #include <QtTest>
 
 class TestPluginLoader : public QObject
@@ -14,6 +15,14 @@ class TestPluginLoader : public QObject
     Q_OBJECT
 
 private slots:
+    // Before any load: where the stand-in trace library writes its lines.
+    void initTestCase()
+    {
+        QVERIFY(m_traceDir.isValid());
+        qputenv("ZOLTLOG_FILE", QFile::encodeName(m_traceDir.filePath("trace.log")));
+        qputenv("ZOLTLOG_LEVEL", "5");
+    }
+
     void metaData()
     {
         QPluginLoader loader(QStringLiteral(ALARMSEARCH_PLUGIN_FILE));
@@ -79,6 +88,33 @@ private slots:
         QCOMPARE(responser.calls, 0);
         delete plugin;
     }
+
+    // The plug-in finds the trace library installed beside it and writes its lines through it.
+    void tracesThroughTheLibraryBesideIt()
+    {
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+        QSKIP("the sanitizer runtime's dlopen does not search the plug-in's run path");
+#endif
+        QPluginLoader loader(QStringLiteral(ALARMSEARCH_PLUGIN_FILE));
+        auto* plugin = qobject_cast<IPluginObjectBase*>(loader.instance());
+        QVERIFY2(plugin, qPrintable(loader.errorString()));
+        FakeHost host;
+        host.tunnel.setAccept(false);
+        plugin->InitialPluginBase(&host);
+        plugin->Request("GetAlarmHistory", QVariantMap(), RequestSenderInfo(), host.answerSink());
+        delete plugin;
+
+        QFile log(m_traceDir.filePath("trace.log"));
+        QVERIFY(log.open(QIODevice::ReadOnly));
+        const QString text = QString::fromUtf8(log.readAll());
+        QVERIFY2(
+            text.contains(" AlarmSearchSrv 2 handleGetAlarmHistory, call getAlarmInfo failed\n"),
+            qPrintable(text));
+        QVERIFY(text.contains(" AlarmSearchSrv 5 Request, Leave\n"));
+    }
+
+private:
+    QTemporaryDir m_traceDir;
 };
 
 QTEST_GUILESS_MAIN(TestPluginLoader)

@@ -9,6 +9,12 @@
 
 using namespace PluginAlarmSearchCommon;
 
+namespace {
+
+void ignoreAnswer(bool, const QString&, const QString&, const QVariant&) {}
+
+} // namespace
+
 PluginAlarmSearchSrv::PluginAlarmSearchSrv()
     : m_lifeGuard(QSharedPointer<PluginLifeGuard>::create(this))
 {
@@ -24,6 +30,8 @@ PluginAlarmSearchSrv::~PluginAlarmSearchSrv()
 bool PluginAlarmSearchSrv::InitialPluginBase(IFrameworkTools* tools)
 {
     EntryLog entryLog(__FILE__, "InitialPluginBase", __LINE__);
+    if (!tools)
+        return true; // nothing to start with: requests are answered as not sent
     HDLR_EVENT_SIGNAL_CB eventSignal = tools->GetEventSignalFunc();
     const bool needsTunnelCtrl = tunnelCtrl().isNull();
     // The host's tunnel client is asked for only when no tunnel control is installed yet.
@@ -42,6 +50,8 @@ void PluginAlarmSearchSrv::Request(const QString& method, const QVariant& args,
                                    const RequestSenderInfo& sender, HDLR_DO_REQUEST_CB reqCB)
 {
     EntryLog entryLog(__FILE__, "Request", __LINE__);
+    if (!reqCB)
+        reqCB = ignoreAnswer; // a client that wants no answer still has its request served
     Qt::HANDLE clientID = sender.clientHandle;
     if (method == METHOD_QUERY_UNHANDLED_ALARM || method == METHOD_QUERY_ALARM_LIST)
         handleQueryAlarm(clientID, args, reqCB);

@@ -1,0 +1,95 @@
+#include "CommandXml.h"
+
+#include <QXmlStreamReader>
+
+namespace AlarmServerSim {
+
+const XmlElement* XmlElement::child(QStringView childName) const
+{
+    for (const XmlElement& element : children) {
+        if (element.name == childName)
+            return &element;
+    }
+    return nullptr;
+}
+
+QList<const XmlElement*> XmlElement::childrenNamed(QStringView childName) const
+{
+    QList<const XmlElement*> found;
+    for (const XmlElement& element : children) {
+        if (element.name == childName)
+            found.append(&element);
+    }
+    return found;
+}
+
+QString XmlElement::attribute(QStringView attributeName) const
+{
+    for (const auto& [attributeKey, value] : attributes) {
+        if (attributeKey == attributeName)
+            return value;
+    }
+    return QString();
+}
+
+QString XmlElement::childText(QStringView childName) const
+{
+    const XmlElement* element = child(childName);
+    return element ? element->text.trimmed() : QString();
+}
+
+std::optional<XmlElement> parseXmlDocument(const QString& text)
+{
+    QXmlStreamReader reader(text);
+    XmlElement root;
+    // Path from the document element down to the element being read.
+    QList<XmlElement*> open;
+    while (!reader.atEnd()) {
+        switch (reader.readNext()) {
+        case QXmlStreamReader::DTD:
+            return std::nullopt;
+        case QXmlStreamReader::StartElement: {
+            XmlElement* element = &root;
+            if (!open.isEmpty()) {
+                open.last()->children.append(XmlElement());
+                element = &open.last()->children.last();
+            }
+            element->name = reader.name().toString();
+            for (const QXmlStreamAttribute& attribute : reader.attributes())
+                element->attributes.append(
+                    {attribute.qualifiedName().toString(), attribute.value().toString()});
+            open.append(element);
+            break;
+        }
+        case QXmlStreamReader::EndElement:
+            open.removeLast();
+            break;
+        case QXmlStreamReader::Characters:
+            if (!open.isEmpty())
+                open.last()->text += reader.text();
+            break;
+        default:
+            break;
+        }
+    }
+    if (reader.hasError() || root.name.isEmpty())
+        return std::nullopt;
+    return root;
+}
+
+void appendTextElement(QString& out, QLatin1String tag, const QString& value)
+{
+    out += QLatin1Char('<');
+    out += tag;
+    if (value.isEmpty()) {
+        out += QLatin1String("/>");
+        return;
+    }
+    out += QLatin1Char('>');
+    out += value.toHtmlEscaped();
+    out += QLatin1String("</");
+    out += tag;
+    out += QLatin1Char('>');
+}
+
+} // namespace AlarmServerSim

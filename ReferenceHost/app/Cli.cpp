@@ -1,0 +1,294 @@
+#include "Cli.h"
+
+#include "Commands.h"
+
+#include <AnswerFormat.h>
+#include <PluginLoader.h>
+
+#include <QCoreApplication>
+#include <QDir>
+#include <QFileInfo>
+
+#include <cstdio>
+
+namespace {
+
+const int kDefaultTimeoutSeconds = 30;
+
+} // namespace
+
+Cli::Cli()
+    : m_pluginOption(QStringLiteral("plugin"),
+                     QStringLiteral("Plug-in file to load (default: $ALARMSEARCH_PLUGIN, else "
+                                    "../plugins/libPluginAlarmSearchSrv.so beside this program)."),
+                     QStringLiteral("path")),
+      m_serverOption(QStringLiteral("server"),
+                     QStringLiteral("Talk to a running alarmsearch-sim over TCP instead of the "
+                                    "embedded server."),
+                     QStringLiteral("host:port")),
+      m_dbOption(QStringLiteral("db"),
+                 QStringLiteral("Database of the embedded server (default: the per-user one)."),
+                 QStringLiteral("path")),
+      m_memoryOption(QStringLiteral("memory"),
+                     QStringLiteral("Embedded server with a fresh in-memory database.")),
+      m_seedCountOption(QStringLiteral("seed-count"),
+                        QStringLiteral("Demo alarms seeded into a new embedded database."),
+                        QStringLiteral("n")),
+      m_prettyOption(QStringLiteral("pretty"), QStringLiteral("Indent JSON output.")),
+      m_xmlOption(QStringLiteral("xml"),
+                  QStringLiteral("Keep the raw XML text that comes with each alarm.")),
+      m_timeoutOption(
+          QStringLiteral("timeout"),
+          QStringLiteral("Seconds to wait for an answer (default %1).").arg(kDefaultTimeoutSeconds),
+          QStringLiteral("seconds"))
+{
+}
+
+Cli::~Cli() = default;
+
+QString Cli::printHelp() const
+{
+    QString help = QStringLiteral(
+        "Usage: alarmsearch [global options] <command> [options]\n"
+        "\n"
+        "Searches and handles alarms through the alarm-search plug-in, loaded into a reference\n"
+        "host. By default the host runs its own alarm server on a per-user database.\n"
+        "\n"
+        "Commands:\n");
+    for (const Commands::Command& command : Commands::all())
+        help += QStringLiteral("  %1%2\n").arg(command.name.leftJustified(10), command.summary);
+    help += QStringLiteral("\nGlobal options (also accepted after the command):\n");
+    QCommandLineParser parser;
+    parser.addOptions({m_pluginOption, m_serverOption, m_dbOption, m_memoryOption,
+                       m_seedCountOption, m_prettyOption, m_xmlOption, m_timeoutOption});
+    parser.addHelpOption();
+    parser.addVersionOption();
+    const QString options = parser.helpText();
+    help += options.mid(options.indexOf(QLatin1String("\n  ")) + 1);
+    help += QStringLiteral("\nRun 'alarmsearch <command> --help' for a command's options.\n");
+    return help;
+}
+
+int Cli::run(const QStringList& arguments)
+{
+    m_globalParser.addOptions({m_pluginOption, m_serverOption, m_dbOption, m_memoryOption,
+                               m_seedCountOption, m_prettyOption, m_xmlOption, m_timeoutOption});
+    const QCommandLineOption helpOption = m_globalParser.addHelpOption();
+    const QCommandLineOption versionOption = m_globalParser.addVersionOption();
+    m_globalParser.setOptionsAfterPositionalArgumentsMode(
+        QCommandLineParser::ParseAsPositionalArguments);
+    if (!m_globalParser.parse(arguments))
+        return usageError(m_globalParser.errorText());
+    if (m_globalParser.isSet(versionOption)) {
+        printOut(QCoreApplication::applicationVersion().toUtf8() + '\n');
+        return ExitOk;
+    }
+
+    QStringList positional = m_globalParser.positionalArguments();
+    if (positional.isEmpty()) {
+        if (m_globalParser.isSet(helpOption)) {
+            printOut(printHelp().toUtf8());
+            return ExitOk;
+        }
+        std::fputs(qPrintable(printHelp()), stderr);
+        return ExitUsage;
+    }
+    m_command = positional.takeFirst();
+    for (const Commands::Command& command : Commands::all()) {
+        if (command.name != m_command)
+            continue;
+        if (m_globalParser.isSet(helpOption))
+            positional.append(QStringLiteral("--help"));
+        return command.run(*this, QStringList{arguments.value(0)} + positional);
+    }
+    return usageError(
+        QStringLiteral("unknown command \"%1\"; see 'alarmsearch --help'").arg(m_command));
+}
+
+bool Cli::parseCommand(QCommandLineParser& parser, const QStringList& arguments, int* exitCode)
+{
+    parser.addOptions({m_pluginOption, m_serverOption, m_dbOption, m_memoryOption,
+                       m_seedCountOption, m_prettyOption, m_xmlOption, m_timeoutOption});
+    const QCommandLineOption helpOption = parser.addHelpOption();
+    if (!parser.parse(arguments)) {
+        *exitCode = usageError(parser.errorText());
+        return false;
+    }
+    if (parser.isSet(helpOption)) {
+        QString help = parser.helpText();
+        help.replace(QCoreApplication::arguments().value(0),
+                     QStringLiteral("alarmsearch ") + m_command);
+        printOut(help.toUtf8());
+        *exitCode = ExitOk;
+        return false;
+    }
+    m_commandParser = &parser;
+    return true;
+}
+
+bool Cli::isSet(const QCommandLineOption& option) const
+{
+    return (m_commandParser && m_commandParser->isSet(option)) || m_globalParser.isSet(option);
+}
+
+QString Cli::value(const QCommandLineOption& option) const
+{
+    if (m_commandParser && m_commandParser->isSet(option))
+        return m_commandParser->value(option);
+    return m_globalParser.value(option);
+}
+
+QString Cli::pluginPath() const
+{
+    return isSet(m_pluginOption) ? value(m_pluginOption) : PluginLoader::defaultPluginPath();
+}
+
+int Cli::timeoutMs() const
+{
+    const int seconds = value(m_timeoutOption).toInt();
+    return (seconds > 0 ? seconds : kDefaultTimeoutSeconds) * 1000;
+}
+
+bool Cli::openHost(int* exitCode)
+{
+    ReferenceHost::Options options;
+    options.pluginPath = pluginPath();
+    options.serverAddress = value(m_serverOption);
+    if (isSet(m_timeoutOption) && value(m_timeoutOption).toInt() <= 0) {
+        *exitCode = usageError(QStringLiteral("--timeout needs a positive number of seconds"));
+        return false;
+    }
+    if (isSet(m_memoryOption) && isSet(m_dbOption)) {
+        *exitCode = usageError(QStringLiteral("--memory and --db exclude each other"));
+        return false;
+    }
+    if (isSet(m_serverOption) && (isSet(m_memoryOption) || isSet(m_dbOption))) {
+        *exitCode = usageError(QStringLiteral("--server talks to a running server; "
+                                              "--db and --memory are for the embedded one"));
+        return false;
+    }
+    if (isSet(m_memoryOption)) {
+        options.embedded.databasePath = QStringLiteral(":memory:");
+    } else {
+        options.embedded.databasePath = isSet(m_dbOption)
+                                            ? value(m_dbOption)
+                                            : AlarmServerSim::AlarmServer::defaultDatabasePath();
+        QDir().mkpath(QFileInfo(options.embedded.databasePath).absolutePath());
+    }
+    if (isSet(m_seedCountOption)) {
+        bool ok = false;
+        options.embedded.seedCount = value(m_seedCountOption).toInt(&ok);
+        if (!ok || options.embedded.seedCount < 0) {
+            *exitCode = usageError(QStringLiteral("--seed-count needs a number of alarms"));
+            return false;
+        }
+    }
+    return openHost(options, exitCode);
+}
+
+bool Cli::openHost(const ReferenceHost::Options& options, int* exitCode)
+{
+    m_host = std::make_unique<ReferenceHost>();
+    QString error;
+    if (!m_host->open(options, &error)) {
+        m_host.reset();
+        *exitCode = fail(error);
+        return false;
+    }
+    return true;
+}
+
+bool Cli::call(const QString& method, const QVariant& args, QList<PluginAnswer>* answers,
+               int* exitCode)
+{
+    QString error;
+    if (m_host->session().call(method, args, timeoutMs(), answers, &error))
+        return true;
+    *exitCode = fail(error);
+    return false;
+}
+
+void Cli::printOut(const QByteArray& bytes)
+{
+    QMutexLocker locker(&m_outputMutex);
+    std::fwrite(bytes.constData(), 1, size_t(bytes.size()), stdout);
+    std::fflush(stdout);
+}
+
+void Cli::printAnswer(const QString& method, const PluginAnswer& answer)
+{
+    printOut(
+        AnswerFormat::jsonLine(AnswerFormat::answerObject(method, answer, keepXml()), pretty()));
+}
+
+void Cli::printError(const QString& message)
+{
+    QMutexLocker locker(&m_outputMutex);
+    std::fprintf(stderr, "alarmsearch: %s\n", qPrintable(message.simplified()));
+    std::fflush(stderr);
+}
+
+void Cli::printNote(const QString& message)
+{
+    QMutexLocker locker(&m_outputMutex);
+    std::fprintf(stderr, "%s\n", qPrintable(message));
+    std::fflush(stderr);
+}
+
+int Cli::fail(const QString& message, int exitCode)
+{
+    printError(message);
+    return exitCode;
+}
+
+int Cli::usageError(const QString& message)
+{
+    return fail(message, ExitUsage);
+}
+
+void Cli::addFilterOptions(QCommandLineParser& parser)
+{
+    parser.addOptions({
+        {QStringLiteral("unhandled"),
+         QStringLiteral("Only unhandled alarms (method QryUnhandledAlarm).")},
+        {QStringLiteral("event"),
+         QStringLiteral("Trigger event, e.g. CamEvent:Motion or StationConn; repeatable."),
+         QStringLiteral("class[:subevent]")},
+        {QStringLiteral("events"),
+         QStringLiteral("All trigger events of a group: camera, system or external; repeatable."),
+         QStringLiteral("group")},
+        {QStringLiteral("state"),
+         QStringLiteral("Alarm state: Unhandled, Processing, Handled or FalseAlarm; repeatable."),
+         QStringLiteral("state")},
+        {QStringLiteral("from"),
+         QStringLiteral("Oldest alarm time (UTC): yyyy-MM-ddTHH:mm:ss, a date, or an age like "
+                        "24h or 7d."),
+         QStringLiteral("time")},
+        {QStringLiteral("to"), QStringLiteral("Newest alarm time, in the same forms as --from."),
+         QStringLiteral("time")},
+        {QStringLiteral("name"), QStringLiteral("Alarm name; repeatable."), QStringLiteral("name")},
+        {QStringLiteral("device"), QStringLiteral("Trigger device name; repeatable."),
+         QStringLiteral("name")},
+        {QStringLiteral("all"),
+         QStringLiteral("Fetch every match, past the server's 5000 alarms per search.")},
+    });
+}
+
+QueryFilter Cli::readFilter(const QCommandLineParser& parser)
+{
+    QueryFilter filter;
+    filter.unhandledOnly = parser.isSet(QStringLiteral("unhandled"));
+    filter.events = parser.values(QStringLiteral("event"));
+    filter.eventGroups = parser.values(QStringLiteral("events"));
+    filter.states = parser.values(QStringLiteral("state"));
+    filter.from = parser.value(QStringLiteral("from"));
+    filter.to = parser.value(QStringLiteral("to"));
+    filter.names = parser.values(QStringLiteral("name"));
+    filter.devices = parser.values(QStringLiteral("device"));
+    return filter;
+}
+
+QStringList Cli::alarmIds(const QCommandLineParser& parser)
+{
+    return parser.positionalArguments() + parser.values(QStringLiteral("id"));
+}

@@ -1,0 +1,75 @@
+#pragma once
+
+#include <HostSession.h>
+#include <QueryArguments.h>
+#include <ReferenceHost.h>
+
+#include <QCommandLineOption>
+#include <QCommandLineParser>
+#include <QMutex>
+
+#include <memory>
+
+// The command-line client: global options, sub-command dispatch, the host it opens and the
+// output channels the commands share.
+class Cli
+{
+public:
+    enum ExitCode { ExitOk = 0, ExitFailed = 1, ExitUsage = 2 };
+
+    Cli();
+    ~Cli();
+
+    int run(const QStringList& arguments);
+
+    // Adds the global options to a command's parser and parses the command's arguments. False
+    // when the command is done already (--help, or a usage error); exitCode tells how.
+    bool parseCommand(QCommandLineParser& parser, const QStringList& arguments, int* exitCode);
+    // Opens the host as the global options say: the plug-in file, the server or database.
+    bool openHost(int* exitCode);
+    bool openHost(const ReferenceHost::Options& options, int* exitCode);
+    HostSession& session() { return m_host->session(); }
+    ReferenceHost& host() { return *m_host; }
+
+    // Sends a request and waits for its answers; on timeout reports it and sets exitCode.
+    bool call(const QString& method, const QVariant& args, QList<PluginAnswer>* answers,
+              int* exitCode);
+
+    // The plug-in file: --plugin, else the default place.
+    QString pluginPath() const;
+    int timeoutMs() const;
+    bool pretty() const { return isSet(m_prettyOption); }
+    bool keepXml() const { return isSet(m_xmlOption); }
+
+    void printOut(const QByteArray& bytes);
+    void printAnswer(const QString& method, const PluginAnswer& answer);
+    void printError(const QString& message);
+    // A remark for the user on standard error.
+    void printNote(const QString& message);
+    int fail(const QString& message, int exitCode = ExitFailed);
+    int usageError(const QString& message);
+
+    static void addFilterOptions(QCommandLineParser& parser);
+    static QueryFilter readFilter(const QCommandLineParser& parser);
+    // Identifiers given as positional arguments and with --id.
+    static QStringList alarmIds(const QCommandLineParser& parser);
+
+private:
+    QString printHelp() const;
+    bool isSet(const QCommandLineOption& option) const;
+    QString value(const QCommandLineOption& option) const;
+
+    QCommandLineOption m_pluginOption;
+    QCommandLineOption m_serverOption;
+    QCommandLineOption m_dbOption;
+    QCommandLineOption m_memoryOption;
+    QCommandLineOption m_seedCountOption;
+    QCommandLineOption m_prettyOption;
+    QCommandLineOption m_xmlOption;
+    QCommandLineOption m_timeoutOption;
+    QCommandLineParser m_globalParser;
+    const QCommandLineParser* m_commandParser = nullptr;
+    QString m_command;
+    QMutex m_outputMutex;
+    std::unique_ptr<ReferenceHost> m_host;
+};

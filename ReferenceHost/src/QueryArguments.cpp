@@ -1,0 +1,175 @@
+#include "QueryArguments.h"
+
+#include "TimeArgument.h"
+
+#include <PluginAlarmSearchCommon.h>
+
+#include <QRegularExpression>
+
+using namespace PluginAlarmSearchCommon;
+
+namespace {
+
+const QString kUnhandled = QStringLiteral("Unhandled");
+
+// The attribute that names a sub-event of an event class, as the ready-made filters use it:
+// "CameraEvent" for "CamEvent", "VCAEvent" for "VCA" and so on.
+QString subEventAttribute(const QString& eventClass)
+{
+    static const QRegularExpression pattern(
+        QStringLiteral("<Event (\\w+)=\"[^\"]*\">([^<]+)</Event>"));
+    for (const QString* filter :
+         {&CAMERA_TRIGGER_EVENT_FILTER_STRING, &SYSTEM_TRIGGER_EVENT_FILTER_STRING,
+          &EXTERNAL_DEVICE_TRIGGER_EVENT_FILTER_STRING}) {
+        auto matches = pattern.globalMatch(*filter);
+        while (matches.hasNext()) {
+            const QRegularExpressionMatch match = matches.next();
+            if (match.captured(2) == eventClass)
+                return match.captured(1);
+        }
+    }
+    return QString();
+}
+
+} // namespace
+
+const QStringList& QueryArguments::alarmStates()
+{
+    static const QStringList states{kUnhandled, QStringLiteral("Processing"),
+                                    QStringLiteral("Handled"), QStringLiteral("FalseAlarm")};
+    return states;
+}
+
+QString QueryArguments::method(const QueryFilter& filter)
+{
+    return filter.unhandledOnly ? METHOD_QUERY_UNHANDLED_ALARM : METHOD_QUERY_ALARM_LIST;
+}
+
+bool QueryArguments::canonicalState(const QString& text, QString* state, QString* errorMessage)
+{
+    QString folded = text;
+    folded.remove(QLatin1Char('-')).remove(QLatin1Char('_'));
+    for (const QString& known : alarmStates()) {
+        if (known.compare(folded, Qt::CaseInsensitive) == 0) {
+            *state = known;
+            return true;
+        }
+    }
+    *errorMessage = QStringLiteral("unknown state \"%1\" (expected one of %2)")
+                        .arg(text, alarmStates().join(QLatin1String(", ")));
+    return false;
+}
+
+bool QueryArguments::eventElement(const QString& event, QString* element, QString* errorMessage)
+{
+    const qsizetype colon = event.indexOf(QLatin1Char(':'));
+    const QString eventClass = event.left(colon).trimmed();
+    if (eventClass.isEmpty()) {
+        *errorMessage =
+            QStringLiteral("bad event \"%1\": expected CLASS or CLASS:SUBEVENT").arg(event);
+        return false;
+    }
+    if (colon < 0) {
+        *element = QStringLiteral("<Event>%1</Event>").arg(eventClass.toHtmlEscaped());
+        return true;
+    }
+    const QString subEvent = event.mid(colon + 1).trimmed();
+    const QString attribute = subEventAttribute(eventClass);
+    if (attribute.isEmpty()) {
+        *errorMessage = QStringLiteral("event class \"%1\" has no sub-events").arg(eventClass);
+        return false;
+    }
+    *element = QStringLiteral("<Event %1=\"%2\">%3</Event>")
+                   .arg(attribute, subEvent.toHtmlEscaped(), eventClass.toHtmlEscaped());
+    return true;
+}
+
+bool QueryArguments::eventGroup(const QString& group, QString* elements, QString* errorMessage)
+{
+    const QString name = group.trimmed().toLower();
+    if (name == QLatin1String("camera"))
+        *elements = CAMERA_TRIGGER_EVENT_FILTER_STRING;
+    else if (name == QLatin1String("system"))
+        *elements = SYSTEM_TRIGGER_EVENT_FILTER_STRING;
+    else if (name == QLatin1String("external"))
+        *elements = EXTERNAL_DEVICE_TRIGGER_EVENT_FILTER_STRING;
+    else {
+        *errorMessage =
+            QStringLiteral("unknown event group \"%1\" (expected camera, system or external)")
+                .arg(group);
+        return false;
+    }
+    return true;
+}
+
+bool QueryArguments::build(const QueryFilter& filter, const QDateTime& now, QVariantMap* args,
+                           QString* errorMessage)
+{
+    QString events;
+    for (const QString& group : filter.eventGroups) {
+        QString elements;
+        if (!eventGroup(group, &elements, errorMessage))
+            return false;
+        events += elements;
+    }
+    for (const QString& event : filter.events) {
+        QString element;
+        if (!eventElement(event, &element, errorMessage))
+            return false;
+        events += element;
+    }
+
+    QStringList states;
+    for (const QString& text : filter.states) {
+        QString state;
+        if (!canonicalState(text, &state, errorMessage))
+            return false;
+        states.append(state);
+    }
+    if (filter.unhandledOnly) {
+        if (!states.isEmpty() && states != QStringList{kUnhandled}) {
+            *errorMessage = QStringLiteral("--unhandled cannot be combined with other states");
+            return false;
+        }
+        states = QStringList{kUnhandled};
+    }
+
+    QString startTime;
+    QString endTime;
+    if (!filter.from.isEmpty() && !TimeArgument::parse(filter.from, TimeArgument::Bound::Start, now,
+                                                       &startTime, errorMessage))
+        return false;
+    if (!filter.to.isEmpty() &&
+        !TimeArgument::parse(filter.to, TimeArgument::Bound::End, now, &endTime, errorMessage))
+        return false;
+    if (!startTime.isEmpty() && !endTime.isEmpty() && startTime > endTime) {
+        *errorMessage = QStringLiteral("--from %1 is after --to %2").arg(startTime, endTime);
+        return false;
+    }
+
+    QVariantList rules;
+    if (!filter.names.isEmpty())
+        rules.append(QVariantMap{{QStringLiteral("type"), 0},
+                                 {QStringLiteral("tagList"), QVariant(filter.names)}});
+    if (!filter.devices.isEmpty())
+        rules.append(QVariantMap{{QStringLiteral("type"), 1},
+                                 {QStringLiteral("tagList"), QVariant(filter.devices)}});
+
+    args->clear();
+    if (!events.isEmpty())
+        args->insert(ARG_TRIGGER_EVENT_FILTER, events);
+    if (!states.isEmpty()) {
+        QString stateList;
+        for (const QString& state : states)
+            stateList += QStringLiteral("<State>%1</State>").arg(state);
+        args->insert(ARG_STATE_FILTER,
+                     QStringLiteral("<AlarmStateList>%1</AlarmStateList>").arg(stateList));
+    }
+    if (!rules.isEmpty())
+        args->insert(ARG_RULES, rules);
+    if (!startTime.isEmpty())
+        args->insert(ARG_START_TIME, startTime);
+    if (!endTime.isEmpty())
+        args->insert(ARG_END_TIME, endTime);
+    return true;
+}

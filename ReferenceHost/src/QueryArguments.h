@@ -1,0 +1,37 @@
+#pragma once
+
+#include <QDateTime>
+#include <QString>
+#include <QStringList>
+#include <QVariantMap>
+
+// What a user asks for in an alarm search, in command-line terms.
+struct QueryFilter
+{
+    bool unhandledOnly = false;
+    QStringList events;      // "CLASS" or "CLASS:SUBEVENT"
+    QStringList eventGroups; // "camera", "system", "external"
+    QStringList states;
+    QString from;
+    QString to;
+    QStringList names;
+    QStringList devices;
+};
+
+// Turns command-line search terms into the argument map of the search requests.
+class QueryArguments
+{
+public:
+    static const QStringList& alarmStates();
+
+    // The request method the filter calls for: unhandled-only searches use "QryUnhandledAlarm".
+    static QString method(const QueryFilter& filter);
+    static bool build(const QueryFilter& filter, const QDateTime& now, QVariantMap* args,
+                      QString* errorMessage);
+    // A state as the server spells it, from any letter case, with or without "-" or "_".
+    static bool canonicalState(const QString& text, QString* state, QString* errorMessage);
+
+private:
+    static bool eventElement(const QString& event, QString* element, QString* errorMessage);
+    static bool eventGroup(const QString& group, QString* elements, QString* errorMessage);
+};

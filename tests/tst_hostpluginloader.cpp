@@ -1,0 +1,66 @@
+#include <IPluginObjectBase.h>
+#include <PluginLoader.h>
+
+#include <QtTest>
+
+class TestHostPluginLoader : public QObject
+{
+    Q_OBJECT
+
+private slots:
+    void loadsGoodPlugin()
+    {
+        PluginLoader loader;
+        QString error;
+        QVERIFY2(loader.load(QStringLiteral(FIXTURE_GoodPlugin), &error), qPrintable(error));
+        QVERIFY(loader.plugin());
+        QCOMPARE(loader.pluginId(), QStringLiteral("FIXTURE0000000000000000000000001"));
+        QVERIFY(error.isEmpty());
+    }
+
+    void rejectsBadFiles_data()
+    {
+        QTest::addColumn<QString>("file");
+        QTest::addColumn<QString>("reason");
+        QTest::newRow("missing file")
+            << QStringLiteral("/nonexistent/libNothing.so") << QStringLiteral("no such file");
+        QTest::newRow("no Qt plug-in")
+            << QStringLiteral(FIXTURE_PlainLibrary) << QStringLiteral("not a Qt plug-in");
+        QTest::newRow("other interface")
+            << QStringLiteral(FIXTURE_OtherIidPlugin)
+            << QStringLiteral("interface identifier \"com.example.SomeOtherInterface\"");
+        QTest::newRow("no PluginID")
+            << QStringLiteral(FIXTURE_NoPluginIdPlugin) << QStringLiteral("no \"PluginID\"");
+        QTest::newRow("not an IPluginObjectBase")
+            << QStringLiteral(FIXTURE_PlainObjectPlugin)
+            << QStringLiteral("instance of PlainObjectPlugin is no IPluginObjectBase");
+    }
+
+    void rejectsBadFiles()
+    {
+        QFETCH(QString, file);
+        QFETCH(QString, reason);
+        PluginLoader loader;
+        QString error;
+        QVERIFY(!loader.load(file, &error));
+        QVERIFY(!loader.plugin());
+        QVERIFY2(error.startsWith(QStringLiteral("cannot load plug-in ") + file),
+                 qPrintable(error));
+        QVERIFY2(error.contains(reason), qPrintable(error));
+        QVERIFY2(!error.contains(QLatin1Char('\n')), qPrintable(error));
+        // The loader's own explanation comes along, in parentheses.
+        QVERIFY2(error.endsWith(QLatin1Char(')')), qPrintable(error));
+    }
+
+    void defaultPathFollowsEnvironment()
+    {
+        qputenv("ALARMSEARCH_PLUGIN", "/opt/x/libP.so");
+        QCOMPARE(PluginLoader::defaultPluginPath(), QStringLiteral("/opt/x/libP.so"));
+        qunsetenv("ALARMSEARCH_PLUGIN");
+        QVERIFY(PluginLoader::defaultPluginPath().endsWith(
+            QStringLiteral("/../plugins/libPluginAlarmSearchSrv.so")));
+    }
+};
+
+QTEST_GUILESS_MAIN(TestHostPluginLoader)
+#include "tst_hostpluginloader.moc"
