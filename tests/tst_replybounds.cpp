@@ -134,8 +134,8 @@ private slots:
         QVERIFY(!query(reply).ok);
 
         // Just within the bound it is read.
-        const QString largest = reply.left(25) + reply.right(18) +
-                                QString(AlarmXmlParser::MaxReplyLength - 43, u' ');
+        const QString largest =
+            reply.left(25) + reply.right(18) + QString(AlarmXmlParser::MaxReplyLength - 43, u' ');
         QCOMPARE(AlarmXmlParser::readAlarmListReply(largest)->size(), 1);
     }
 
@@ -143,10 +143,9 @@ private slots:
     {
         QTest::addColumn<QString>("reply");
         QTest::newRow("entity bomb")
-            << "<!DOCTYPE QryAlarmListRes [<!ENTITY a '" + QString(1000, u'a') +
-                   "'><!ENTITY b '" + QStringLiteral("&a;").repeated(1000) +
-                   "'>]><QryAlarmListRes><Alarm><N>" + QStringLiteral("&b;").repeated(1000) +
-                   "</N></Alarm></QryAlarmListRes>";
+            << "<!DOCTYPE QryAlarmListRes [<!ENTITY a '" + QString(1000, u'a') + "'><!ENTITY b '" +
+                   QStringLiteral("&a;").repeated(1000) + "'>]><QryAlarmListRes><Alarm><N>" +
+                   QStringLiteral("&b;").repeated(1000) + "</N></Alarm></QryAlarmListRes>";
         QTest::newRow("document type only")
             << "<!DOCTYPE QryAlarmListRes><QryAlarmListRes><Alarm/></QryAlarmListRes>";
         QTest::newRow("reference to U+0001")
