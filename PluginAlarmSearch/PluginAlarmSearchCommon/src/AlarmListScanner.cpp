@@ -118,14 +118,7 @@ public:
         skipSpace();
         if (m_pos != m_end)
             return std::nullopt;
-
-        QVariantList alarms;
-        alarms.reserve(qsizetype(m_alarms.size()));
-        for (std::size_t i = 0; i < m_alarms.size(); ++i) {
-            m_alarms[i].insert(XmlKey, m_alarmTexts[i]);
-            alarms.append(QVariant(std::move(m_alarms[i])));
-        }
-        return alarms;
+        return std::move(m_alarms);
     }
 
 private:
@@ -508,7 +501,7 @@ private:
     void addAlarm(bool afterText)
     {
         QVariant rendering = render(0);
-        m_alarms.push_back(rendering.toMap());
+        m_alarm = rendering.toMap();
         rendering.clear();
 
         // Written into a buffer that keeps its capacity from alarm to alarm; whether a line break
@@ -522,11 +515,14 @@ private:
         m_attributes.clear();
     }
 
-    // Ends the text of the alarm read last and keeps a copy of just the right size.
+    // Ends the text of the alarm read last and adds the alarm, with a copy of its text of just
+    // the right size.
     void finishAlarmText(bool beforeText)
     {
         DomStyleWriter(m_xml).lineBreak(beforeText);
-        m_alarmTexts.emplace_back(m_xml.constData(), m_xml.size());
+        m_alarm.insert(XmlKey, QString(m_xml.constData(), m_xml.size()));
+        m_alarms.append(QVariant(std::move(m_alarm)));
+        m_alarm = QVariantMap();
         m_alarmPending = false;
     }
 
@@ -628,10 +624,11 @@ private:
     std::vector<Node> m_nodes;
     std::vector<Attribute> m_attributes;
 
-    std::vector<QVariantMap> m_alarms;
-    std::vector<QString> m_alarmTexts;
+    QVariantList m_alarms;
+    // The alarm read last, its text in m_xml still without its line break, while m_alarmPending.
+    QVariantMap m_alarm;
     QString m_xml;
-    bool m_alarmPending = false; // m_xml holds an alarm's text, still without its line break
+    bool m_alarmPending = false;
     QHash<QStringView, QString> m_elementKeys;
     QHash<QStringView, QString> m_attributeKeys;
     QHash<QStringView, QString> m_texts; // keys view the reply text
