@@ -3,6 +3,7 @@
 #include <QString>
 #include <QVariant>
 #include <QVariantList>
+#include <QVariantMap>
 
 // Turns an XML document into nested QVariant values in one streaming pass.
 //
@@ -37,6 +38,10 @@ public:
     // One entry per element of a name: the list itself for repeated elements, a one-element
     // list for a single one, an empty list for an invalid value.
     static QVariantList transContentAsList(const QVariant& value);
+
+    // Adds a child's rendering to its parent's map: under its name, or appended to the list of
+    // its namesakes when the name is taken.
+    static void addChild(QVariantMap& content, const QString& name, QVariant value);
 
 private:
     QString m_errorString;

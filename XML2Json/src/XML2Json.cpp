@@ -31,19 +31,6 @@ struct OpenElement
     }
 };
 
-void addChild(QVariantMap& content, const QString& name, QVariant value)
-{
-    const auto it = content.find(name);
-    if (it == content.end()) {
-        content.insert(name, std::move(value));
-    } else if (it->userType() == QMetaType::QVariantList) {
-        static_cast<QVariantList*>(it->data())->append(std::move(value));
-    } else {
-        QVariantList repeated{std::move(*it), std::move(value)};
-        *it = std::move(repeated);
-    }
-}
-
 OpenElement openElement(const QXmlStreamReader& reader)
 {
     OpenElement element{reader.qualifiedName().toString(), {}, {}, {}};
@@ -89,7 +76,7 @@ QVariant XML2Json::parse(const QString& xml)
             if (open.empty())
                 result = QVariantMap{{name, std::move(rendering)}};
             else
-                addChild(open.back().content, name, std::move(rendering));
+                XML2Json::addChild(open.back().content, name, std::move(rendering));
             break;
         }
         case QXmlStreamReader::Characters: {
@@ -129,4 +116,17 @@ QVariantList XML2Json::transContentAsList(const QVariant& value)
     if (value.userType() == QMetaType::QVariantList)
         return value.toList();
     return {value};
+}
+
+void XML2Json::addChild(QVariantMap& content, const QString& name, QVariant value)
+{
+    const auto it = content.find(name);
+    if (it == content.end()) {
+        content.insert(name, std::move(value));
+    } else if (it->userType() == QMetaType::QVariantList) {
+        static_cast<QVariantList*>(it->data())->append(std::move(value));
+    } else {
+        QVariantList repeated{std::move(*it), std::move(value)};
+        *it = std::move(repeated);
+    }
 }

@@ -1,11 +1,50 @@
 #include "AlarmXmlParser.h"
 
+#include "AlarmListScanner.h"
 #include "XmlHelper.h"
 
+#include <XML2Json.h>
+
 #include <QDomDocument>
+#include <QXmlStreamReader>
+
+namespace {
+
+// Streams through the text before a DOM is built from it: false for text the DOM must not be
+// built from. The DOM would take time quadratic in the nesting depth, and its destructor and
+// writer recurse.
+bool safeForDom(const QString& text)
+{
+    if (text.size() > AlarmXmlParser::MaxReplyLength)
+        return false;
+    QXmlStreamReader reader(text);
+    int depth = 0;
+    while (!reader.atEnd()) {
+        switch (reader.readNext()) {
+        case QXmlStreamReader::StartElement:
+            if (++depth > AlarmXmlParser::MaxDepth)
+                return false;
+            break;
+        case QXmlStreamReader::EndElement:
+            --depth;
+            break;
+        case QXmlStreamReader::DTD:
+            return false;
+        default:
+            break;
+        }
+    }
+    // A fault ends the pass as it ends the DOM's parse: what comes after it is never built.
+    return true;
+}
+
+} // namespace
 
 QList<QString> AlarmXmlParser::getAlarmList(const QString& replyText)
 {
+    if (!safeForDom(replyText))
+        return {};
+
     // A reply that breaks off keeps what was built before the fault, so the result of setContent
     // is deliberately not looked at.
     QDomDocument document;
@@ -16,4 +55,41 @@ QList<QString> AlarmXmlParser::getAlarmList(const QString& replyText)
         document.documentElement(), QStringLiteral("Alarm"),
         [&alarms](const QDomElement& alarm) { alarms.append(XmlHelper::nodeToXml(alarm)); });
     return alarms;
+}
+
+std::optional<QVariantList> AlarmXmlParser::readAlarmListReply(const QString& replyText)
+{
+    if (replyText.size() > MaxReplyLength)
+        return std::nullopt;
+    if (std::optional<QVariantList> alarms = AlarmListScanner::read(replyText))
+        return alarms;
+    return readAlarmListReplyGeneral(replyText);
+}
+
+std::optional<QVariantList> AlarmXmlParser::readAlarmListReplyGeneral(const QString& replyText)
+{
+    if (replyText.size() > MaxReplyLength)
+        return std::nullopt;
+    const QVariant parsed = XML2Json().parse(replyText);
+    if (!parsed.isValid() || parsed.isNull())
+        return std::nullopt;
+
+    const QVariantList alarms =
+        XML2Json::transContentAsList(parsed.toMap()
+                                         .value(QStringLiteral("QryAlarmListRes"))
+                                         .toMap()
+                                         .value(QStringLiteral("Alarm")));
+    const QList<QString> alarmTexts = getAlarmList(replyText);
+
+    // Alarm maps and texts are paired by position; should the texts run short, the remaining
+    // alarms get an empty text rather than another alarm's.
+    const QString xmlKey = QStringLiteral("XML");
+    QVariantList result;
+    result.reserve(alarms.size());
+    for (qsizetype i = 0; i < alarms.size(); ++i) {
+        QVariantMap alarm = alarms.at(i).toMap();
+        alarm.insert(xmlKey, i < alarmTexts.size() ? alarmTexts.at(i) : QString());
+        result.append(QVariant(std::move(alarm)));
+    }
+    return result;
 }

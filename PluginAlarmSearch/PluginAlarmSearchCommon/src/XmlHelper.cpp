@@ -1,6 +1,141 @@
 #include "XmlHelper.h"
 
+#include "DomStyleWriter.h"
+
 #include <QTextStream>
+
+namespace {
+
+// Elements with more attributes are left to QDomNode::save: QDomNamedNodeMap::item(i) walks
+// the attribute hash from its start, so reading every attribute by index is quadratic.
+constexpr int MaxIndexedAttributes = 64;
+
+bool isTextNode(const QDomNode& node)
+{
+    return node.isText(); // also true for CDATA sections, as QDomNode::save sees them
+}
+
+// Writes the subtree below a node iteratively.
+class DomNodeWriter
+{
+public:
+    enum class Outcome { Written, TooDeep, Unsupported };
+
+    explicit DomNodeWriter(QString& out) : m_writer(out) {}
+
+    Outcome write(const QDomNode& top)
+    {
+        QDomNode node = top;
+        int level = 1;
+        for (;;) {
+            if (level > XmlHelper::MaxDepth)
+                return Outcome::TooDeep;
+            if (!enter(node, level))
+                return Outcome::Unsupported;
+            if (node.isElement() && node.hasChildNodes()) {
+                node = node.firstChild();
+                ++level;
+                continue;
+            }
+            // Climb to the next node to enter, closing the elements that end on the way.
+            while (node != top && node.nextSibling().isNull()) {
+                node = node.parentNode();
+                --level;
+                leaveElement(node.toElement(), level);
+            }
+            if (node == top)
+                return Outcome::Written;
+            node = node.nextSibling();
+        }
+    }
+
+private:
+    // Writes what comes before a node's children; false for a node it does not write.
+    bool enter(const QDomNode& node, int level)
+    {
+        const bool afterText = isTextNode(node.previousSibling());
+        const bool beforeText = isTextNode(node.nextSibling());
+        switch (node.nodeType()) {
+        case QDomNode::ElementNode:
+            return startElement(node.toElement(), level, afterText, beforeText);
+        case QDomNode::TextNode:
+            m_writer.text(node.nodeValue(), !node.parentNode().isElement());
+            return true;
+        case QDomNode::CDATASectionNode:
+            m_writer.cdata(node.nodeValue());
+            return true;
+        case QDomNode::CommentNode:
+            m_writer.comment(node.nodeValue(), level, afterText, beforeText);
+            return true;
+        case QDomNode::ProcessingInstructionNode:
+            m_writer.processingInstruction(node.nodeName(), node.nodeValue());
+            return true;
+        default:
+            return false;
+        }
+    }
+
+    bool startElement(const QDomElement& element, int level, bool afterText, bool beforeText)
+    {
+        const QDomNamedNodeMap attributes = element.attributes();
+        if (!element.namespaceURI().isNull() || attributes.count() > MaxIndexedAttributes)
+            return false;
+        m_writer.openStartTag(element.tagName(), level, afterText);
+        for (int i = 0; i < attributes.count(); ++i) {
+            const QDomAttr attribute = attributes.item(i).toAttr();
+            if (!attribute.namespaceURI().isNull())
+                return false;
+            m_writer.attribute(attribute.name(), attribute.value());
+        }
+        const bool hasChildren = element.hasChildNodes();
+        m_writer.closeStartTag(hasChildren, isTextNode(element.firstChild()));
+        if (!hasChildren)
+            m_writer.lineBreak(beforeText);
+        return true;
+    }
+
+    void leaveElement(const QDomElement& element, int level)
+    {
+        m_writer.endTag(element.tagName(), level, isTextNode(element.lastChild()));
+        m_writer.lineBreak(isTextNode(element.nextSibling()));
+    }
+
+    DomStyleWriter m_writer;
+};
+
+// Levels of the subtree below node, counted without recursion up to just past the bound.
+bool withinDepth(const QDomNode& top)
+{
+    QDomNode node = top;
+    int level = 1;
+    for (;;) {
+        if (level > XmlHelper::MaxDepth)
+            return false;
+        if (node.hasChildNodes()) {
+            node = node.firstChild();
+            ++level;
+            continue;
+        }
+        while (node != top && node.nextSibling().isNull()) {
+            node = node.parentNode();
+            --level;
+        }
+        if (node == top)
+            return true;
+        node = node.nextSibling();
+    }
+}
+
+QString savedByDom(const QDomNode& node)
+{
+    QString xml;
+    QTextStream stream(&xml);
+    node.save(stream, 4);
+    stream.flush();
+    return xml;
+}
+
+} // namespace
 
 void XmlHelper::doSomeThingAllChildElement(const QDomElement& parent, const QString& tagName,
                                            ElementAction action)
@@ -13,9 +148,16 @@ void XmlHelper::doSomeThingAllChildElement(const QDomElement& parent, const QStr
 
 QString XmlHelper::nodeToXml(const QDomNode& node)
 {
+    if (node.isNull())
+        return QString();
     QString xml;
-    QTextStream stream(&xml);
-    node.save(stream, 4);
-    stream.flush();
-    return xml;
+    switch (DomNodeWriter(xml).write(node)) {
+    case DomNodeWriter::Outcome::Written:
+        return xml;
+    case DomNodeWriter::Outcome::TooDeep:
+        return QString();
+    case DomNodeWriter::Outcome::Unsupported:
+        break;
+    }
+    return withinDepth(node) ? savedByDom(node) : QString();
 }

@@ -33,20 +33,36 @@ bool replyAccepted(bool ok, const QString& statusText)
     return ok && !(converted && (status & 0x80000000ULL));
 }
 
+// Judges a reply's status; writes the reader's failure line when it is rejected.
+bool acceptReply(const char* readerName, const char* rejectedFormat, bool ok,
+                 const QString& statusText)
+{
+    if (replyAccepted(ok, statusText))
+        return true;
+    ALARMSEARCH_TRACE_FAILURE(rejectedFormat, readerName,
+                              AlarmSearchTrace::text(statusText).constData());
+    return false;
+}
+
+void traceParseFailure(const char* readerName, const QString& replyText)
+{
+    ALARMSEARCH_TRACE_FAILURE("%s, parse message failed, %s", readerName,
+                              AlarmSearchTrace::text(replyText).constData());
+}
+
 // Judges and converts a reply. Writes the reader's failure line and returns nothing when the
-// reply was rejected or does not parse.
+// reply was rejected or does not parse; text longer than the alarm list's bound counts as not
+// parseable.
 std::optional<QVariantMap> readReply(const char* readerName, const char* rejectedFormat, bool ok,
                                      const QString& statusText, const QString& replyText)
 {
-    if (!replyAccepted(ok, statusText)) {
-        ALARMSEARCH_TRACE_FAILURE(rejectedFormat, readerName,
-                                  AlarmSearchTrace::text(statusText).constData());
+    if (!acceptReply(readerName, rejectedFormat, ok, statusText))
         return std::nullopt;
-    }
-    const QVariant parsed = XML2Json().parse(replyText);
+    const QVariant parsed = replyText.size() > AlarmXmlParser::MaxReplyLength
+                                ? QVariant()
+                                : XML2Json().parse(replyText);
     if (!parsed.isValid() || parsed.isNull()) {
-        ALARMSEARCH_TRACE_FAILURE("%s, parse message failed, %s", readerName,
-                                  AlarmSearchTrace::text(replyText).constData());
+        traceParseFailure(readerName, replyText);
         return std::nullopt;
     }
     return parsed.toMap();
@@ -90,28 +106,18 @@ void ORVOSrvTunnelControl::queryAlarmCB(bool ok, const QString& relayPath,
                                         const QString& statusText, const QString& replyText,
                                         bool isLast, QueryAlarmCompletion completion)
 {
-    const std::optional<QVariantMap> reply =
-        readReply("queryAlarmCB", "%s, QryAlarmList failed, %s", ok, statusText, replyText);
-    if (!reply) {
+    const char* const readerName = "queryAlarmCB";
+    if (!acceptReply(readerName, "%s, QryAlarmList failed, %s", ok, statusText)) {
         completion(false, isLast, QVariant(), statusText, relayPath);
         return;
     }
-
-    const QVariantList alarms = XML2Json::transContentAsList(
-        reply->value(QStringLiteral("QryAlarmListRes")).toMap().value(QStringLiteral("Alarm")));
-    const QList<QString> alarmTexts = AlarmXmlParser::getAlarmList(replyText);
-
-    // Alarm maps and texts are paired by position; should the texts run short, the remaining
-    // alarms get an empty text rather than another alarm's.
-    const QString xmlKey = QStringLiteral("XML");
-    QVariantList result;
-    result.reserve(alarms.size());
-    for (qsizetype i = 0; i < alarms.size(); ++i) {
-        QVariantMap alarm = alarms.at(i).toMap();
-        alarm.insert(xmlKey, i < alarmTexts.size() ? alarmTexts.at(i) : QString());
-        result.append(QVariant(std::move(alarm)));
+    std::optional<QVariantList> alarms = AlarmXmlParser::readAlarmListReply(replyText);
+    if (!alarms) {
+        traceParseFailure(readerName, replyText);
+        completion(false, isLast, QVariant(), statusText, relayPath);
+        return;
     }
-    completion(true, isLast, QVariant(std::move(result)), statusText, relayPath);
+    completion(true, isLast, QVariant(std::move(*alarms)), statusText, relayPath);
 }
 
 bool ORVOSrvTunnelControl::processAlarm(void* clientID, const QMap<QString, QVariant>& args,

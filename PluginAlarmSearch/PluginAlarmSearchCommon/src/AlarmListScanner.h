@@ -1,0 +1,23 @@
+#pragma once
+
+#include <QString>
+#include <QVariantList>
+
+#include <optional>
+
+// Reads an alarm-list reply in one pass over its UTF-16 text and gives exactly what
+// AlarmXmlParser::readAlarmListReplyGeneral gives, for replies in the plain form servers write:
+// - an optional XML declaration of version 1.0 (encoding UTF-8), then one document element,
+//   with nothing but white space around it;
+// - names of ASCII letters, digits, "_", "-" and "." (so no namespace prefixes), no "xmlns";
+// - text and attribute values of characters XML allows, with the five predefined entities and
+//   character references (in text not to control characters); no raw carriage returns;
+// - no comments, processing instructions, CDATA sections or document type declaration;
+// - nesting up to XML2Json::MaxDepth, up to 32 attributes per element.
+// Anything else gives nothing, also text that is not well-formed, and the caller takes the
+// general route.
+class AlarmListScanner
+{
+public:
+    static std::optional<QVariantList> read(const QString& replyText);
+};

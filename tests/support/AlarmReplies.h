@@ -1,0 +1,68 @@
+#pragma once
+
+#include <QString>
+#include <QStringList>
+
+// Alarm-list replies as the alarm server writes them, with varied but repeatable values: some
+// notes carry "&amp;", non-ASCII text and characters outside the basic plane, some alarms are
+// muted.
+namespace AlarmReplies {
+
+inline QString alarm(int n)
+{
+    static const QStringList subEvents{"Motion", "DI", "VideoLossRestore", "Tampering", "PIR"};
+    static const QStringList devices{"Lobby Entrance",
+                                     "Parking Level -2",
+                                     "Warehouse Dock 3",
+                                     QString::fromUtf8("Kamera Süd"),
+                                     QString::fromUtf8("東門 カメラ"),
+                                     "Server Room"};
+    static const QStringList states{"Unhandled", "Handling", "Handled", "Closed"};
+    static const QStringList notes{
+        QString(),
+        "Checked by guard",
+        "Door &amp; gate checked, all clear",
+        QString::fromUtf8("Fehlalarm: Katze \u00fcber Zaun"),
+        QString::fromUtf8(
+            "\u73fe\u5834\u78ba\u8a8d\u6e08\u307f \U0001F6A8 escalated to &lt;ops&gt;"),
+        "Long note: " + QStringLiteral("camera moved by wind; ").repeated(6)};
+
+    const QString& device = devices.at(n % devices.size());
+    const QString& subEvent = subEvents.at(n % subEvents.size());
+    const QString& note = notes.at((n / 3) % notes.size());
+    const bool muted = n % 7 == 0;
+    const int second = n % 60;
+    const int minute = (n / 60) % 60;
+    const int hour = (n / 3600) % 24;
+    const QString time = QStringLiteral("2026-11-20T%1:%2:%3Z")
+                             .arg(hour, 2, 10, QLatin1Char('0'))
+                             .arg(minute, 2, 10, QLatin1Char('0'))
+                             .arg(second, 2, 10, QLatin1Char('0'));
+    QString xml = QStringLiteral("<Alarm>");
+    xml += QStringLiteral("<AlarmID>A%1</AlarmID>").arg(n, 7, 10, QLatin1Char('0'));
+    xml += QStringLiteral("<EventClass>CamEvent</EventClass><SubEventType>CameraEvent"
+                          "</SubEventType>");
+    xml += QStringLiteral("<SubEvent>%1</SubEvent>").arg(subEvent);
+    xml += QStringLiteral("<AlarmName>%1 at %2</AlarmName>").arg(subEvent, device);
+    xml += QStringLiteral("<DeviceName>%1</DeviceName>").arg(device);
+    xml += QStringLiteral("<State>%1</State>").arg(states.at(n % states.size()));
+    xml += QStringLiteral("<ServerTime>%1</ServerTime>").arg(time);
+    xml += note.isEmpty() ? QStringLiteral("<Note/>") : QStringLiteral("<Note>%1</Note>").arg(note);
+    xml += muted ? QStringLiteral("<Muted>true</Muted><MuteUntil>%1</MuteUntil>").arg(time)
+                 : QStringLiteral("<Muted>false</Muted><MuteUntil/>");
+    xml += QStringLiteral("</Alarm>");
+    return xml;
+}
+
+// A "QryAlarmListRes" reply with count alarms, one per line.
+inline QString reply(int count)
+{
+    QString xml = QStringLiteral("<QryAlarmListRes>\n");
+    xml.reserve(count * 420);
+    for (int n = 1; n <= count; ++n)
+        xml.append(alarm(n)).append(u'\n');
+    xml += QStringLiteral("</QryAlarmListRes>");
+    return xml;
+}
+
+} // namespace AlarmReplies
