@@ -141,6 +141,9 @@ private slots:
                 wrap("<Alarm><AlarmID>2</AlarmID><XML>own</XML></Alarm>"));
         scanner("repeated child names",
                 wrap("<Alarm><Tag>a</Tag><Tag>b</Tag><Tag><x/></Tag><Tag k='v'/></Alarm>"));
+        scanner("repeated names among others, keys of every kind",
+                wrap("<Alarm b='1' A='2'>t<Tag>a</Tag><B>1</B><Tag>b</Tag><a x='1'/><Tag>c</Tag>"
+                     "u<B>2</B><_c/><a/></Alarm><Alarm><a/><Tag>d</Tag><A/></Alarm>"));
         scanner("empty elements", wrap("<Alarm/><Alarm></Alarm><Alarm><A></A><B/></Alarm>"));
         scanner("alarm of text only", wrap("<Alarm>just text</Alarm>"));
         scanner("XML declaration", "<?xml version=\"1.0\"?>" + wrap("<Alarm/>"));

@@ -7,7 +7,10 @@
 #include <QHash>
 #include <QVarLengthArray>
 
+#include <algorithm>
 #include <array>
+#include <map>
+#include <numeric>
 #include <vector>
 
 namespace {
@@ -22,6 +25,7 @@ const QString ReplyName = QStringLiteral("QryAlarmListRes");
 const QString AlarmName = QStringLiteral("Alarm");
 const QString XmlKey = QStringLiteral("XML");
 const QString TextKey = QStringLiteral("#text");
+constexpr int TextKeyId = 0; // the first of the scanner's map keys
 const QString EmptyText = QStringLiteral("");
 
 // How a character of ASCII is read in text.
@@ -520,22 +524,32 @@ private:
     void finishAlarmText(bool beforeText)
     {
         DomStyleWriter(m_xml).lineBreak(beforeText);
-        m_alarm.insert(XmlKey, QString(m_xml.constData(), m_xml.size()));
+        m_alarm.insert(XmlKey, QStringView(m_xml).toString());
         m_alarms.append(QVariant(std::move(m_alarm)));
         m_alarm = QVariantMap();
         m_alarmPending = false;
     }
 
-    const QString& key(QStringView name, QHash<QStringView, QString>& cache, QStringView prefix)
+    // The number of the map key prefix + name; keys are numbered as they first turn up, and
+    // m_keyRanks holds their order in a QVariantMap.
+    int keyId(QStringView name, QHash<QStringView, int>& cache, QStringView prefix)
     {
-        auto it = cache.find(name);
-        if (it == cache.end()) {
-            QString text;
-            text.reserve(prefix.size() + name.size());
-            text.append(prefix).append(name);
-            it = cache.insert(name, text);
-        }
-        return *it;
+        const auto it = cache.constFind(name);
+        if (it != cache.cend())
+            return *it;
+        const int id = int(m_keys.size());
+        QString key;
+        key.reserve(prefix.size() + name.size());
+        m_keys.push_back(key.append(prefix).append(name));
+        cache.insert(name, id);
+
+        std::vector<int> order(m_keys.size());
+        std::iota(order.begin(), order.end(), 0);
+        std::sort(order.begin(), order.end(), [&](int a, int b) { return m_keys[a] < m_keys[b]; });
+        m_keyRanks.resize(order.size());
+        for (std::size_t rank = 0; rank < order.size(); ++rank)
+            m_keyRanks[std::size_t(order[rank])] = int(rank);
+        return id;
     }
 
     // The node's rendering as XML2Json::parse gives it.
@@ -552,23 +566,56 @@ private:
                 leaf += m_nodes[std::size_t(child)].text;
             return leaf.isNull() ? EmptyText : leaf;
         }
-        QVariantMap content;
+
+        // The entries in document order, then sorted by key so that each goes in at the map's
+        // end without searching; repeated names stay in document order and become a list.
+        struct Entry
+        {
+            int key;
+            QVariant value;
+        };
+        QVarLengthArray<Entry, 32> entries;
         for (qsizetype a = node.attributesBegin; a < node.attributesEnd; ++a) {
             const Attribute& attribute = m_attributes[std::size_t(a)];
-            content.insert(key(attribute.name, m_attributeKeys, u"@"), attribute.value);
+            entries.append({keyId(attribute.name, m_attributeKeys, u"@"), attribute.value});
         }
         QString text;
         for (qsizetype child = index + 1; child < node.end;
              child = m_nodes[std::size_t(child)].end) {
             const Node& childNode = m_nodes[std::size_t(child)];
             if (!childNode.isText())
-                XML2Json::addChild(content, key(childNode.name, m_elementKeys, {}), render(child));
+                entries.append({keyId(childNode.name, m_elementKeys, {}), render(child)});
             else if (!childNode.xmlWhitespace)
                 text += childNode.text;
         }
         if (!text.isEmpty())
-            content.insert(TextKey, text);
-        return content;
+            entries.append({TextKeyId, std::move(text)});
+        // Positions ordered by the rank of their key, ties in document order.
+        QVarLengthArray<std::pair<int, int>, 32> order;
+        for (int i = 0; i < int(entries.size()); ++i)
+            order.append({m_keyRanks[std::size_t(entries[i].key)], i});
+        std::sort(order.begin(), order.end());
+
+        std::map<QString, QVariant> content;
+        for (auto it = order.cbegin(); it != order.cend();) {
+            const auto next = std::find_if(it + 1, order.cend(), [&](const auto& position) {
+                return position.first != it->first;
+            });
+            Entry& first = entries[it->second];
+            QVariant value;
+            if (next - it == 1) {
+                value = std::move(first.value);
+            } else {
+                QVariantList repeated;
+                repeated.reserve(next - it);
+                for (auto same = it; same != next; ++same)
+                    repeated.append(std::move(entries[same->second].value));
+                value = std::move(repeated);
+            }
+            content.emplace_hint(content.cend(), m_keys[std::size_t(first.key)], std::move(value));
+            it = next;
+        }
+        return QVariantMap(std::move(content));
     }
 
     // The element as XmlHelper::nodeToXml writes it, without the line break after it.
@@ -627,10 +674,12 @@ private:
     QVariantList m_alarms;
     // The alarm read last, its text in m_xml still without its line break, while m_alarmPending.
     QVariantMap m_alarm;
-    QString m_xml;
+    std::u16string m_xml;
     bool m_alarmPending = false;
-    QHash<QStringView, QString> m_elementKeys;
-    QHash<QStringView, QString> m_attributeKeys;
+    std::vector<QString> m_keys{TextKey};
+    std::vector<int> m_keyRanks{0};
+    QHash<QStringView, int> m_elementKeys;
+    QHash<QStringView, int> m_attributeKeys;
     QHash<QStringView, QString> m_texts; // keys view the reply text
 };
 

@@ -1,7 +1,5 @@
 #include "DomStyleWriter.h"
 
-#include <algorithm>
-
 namespace {
 
 constexpr int IndentWidth = 4;
@@ -10,48 +8,50 @@ constexpr int IndentWidth = 4;
 
 void DomStyleWriter::indent(int level)
 {
-    static constexpr QStringView Spaces =
-        u"                                                                ";
-    for (qsizetype missing = qsizetype(level) * IndentWidth; missing > 0; missing -= Spaces.size())
-        m_out.append(Spaces.first(std::min(missing, Spaces.size())));
+    m_out.append(std::size_t(level) * IndentWidth, u' ');
 }
 
 void DomStyleWriter::openStartTag(QStringView name, int level, bool afterText)
 {
     if (!afterText)
         indent(level);
-    m_out.append(u'<').append(name);
+    put(u'<');
+    put(name);
 }
 
 void DomStyleWriter::attribute(QStringView name, QStringView value)
 {
-    m_out.append(u' ').append(name).append(u"=\"");
+    put(u' ');
+    put(name);
+    put(u"=\"");
     escaped(value, true, true);
-    m_out.append(u'"');
+    put(u'"');
 }
 
 void DomStyleWriter::closeStartTag(bool hasChildren, bool firstChildIsText)
 {
     if (!hasChildren) {
-        m_out.append(u"/>");
+        put(u"/>");
         return;
     }
-    m_out.append(u'>');
+    put(u'>');
     if (!firstChildIsText)
-        m_out.append(u'\n');
+        put(u'\n');
 }
 
 void DomStyleWriter::endTag(QStringView name, int level, bool lastChildIsText)
 {
     if (!lastChildIsText)
         indent(level);
-    m_out.append(u"</").append(name).append(u'>');
+    put(u"</");
+    put(name);
+    put(u'>');
 }
 
 void DomStyleWriter::lineBreak(bool beforeText)
 {
     if (!beforeText)
-        m_out.append(u'\n');
+        put(u'\n');
 }
 
 void DomStyleWriter::text(QStringView value, bool encodeQuotes)
@@ -61,24 +61,31 @@ void DomStyleWriter::text(QStringView value, bool encodeQuotes)
 
 void DomStyleWriter::cdata(QStringView value)
 {
-    m_out.append(u"<![CDATA[").append(value).append(u"]]>");
+    put(u"<![CDATA[");
+    put(value);
+    put(u"]]>");
 }
 
 void DomStyleWriter::comment(QStringView value, int level, bool afterText, bool beforeText)
 {
     if (!afterText)
         indent(level);
-    m_out.append(u"<!--").append(value);
+    put(u"<!--");
+    put(value);
     // Keeps a comment ending in "-" from closing with "--->".
     if (value.endsWith(u'-'))
-        m_out.append(u' ');
-    m_out.append(u"-->");
+        put(u' ');
+    put(u"-->");
     lineBreak(beforeText);
 }
 
 void DomStyleWriter::processingInstruction(QStringView target, QStringView data)
 {
-    m_out.append(u"<?").append(target).append(u' ').append(data).append(u"?>\n");
+    put(u"<?");
+    put(target);
+    put(u' ');
+    put(data);
+    put(u"?>\n");
 }
 
 void DomStyleWriter::escaped(QStringView value, bool encodeQuotes, bool attributeValue)
@@ -117,9 +124,10 @@ void DomStyleWriter::escaped(QStringView value, bool encodeQuotes, bool attribut
             break;
         }
         if (!replacement.isEmpty()) {
-            m_out.append(value.mid(plainFrom, i - plainFrom)).append(replacement);
+            put(value.mid(plainFrom, i - plainFrom));
+            put(replacement);
             plainFrom = i + 1;
         }
     }
-    m_out.append(value.mid(plainFrom));
+    put(value.mid(plainFrom));
 }

@@ -1,7 +1,8 @@
 #pragma once
 
-#include <QString>
 #include <QStringView>
+
+#include <string>
 
 // Appends XML text laid out and escaped as QDomNode::save writes it with an indent of 4:
 // - an element's start tag is indented by 4 spaces per level unless it follows text;
@@ -11,11 +12,12 @@
 // - an end tag is indented unless the element's last child is text;
 // - text escapes "<", "&", ">" after "]]" and carriage returns (and quotes outside elements);
 //   attribute values also escape quotes, tabs and line feeds.
-// Callers walk their tree and say where text stands next to each node.
+// Callers walk their tree and say where text stands next to each node. The output is a
+// std::u16string, whose appends of short pieces are inline, unlike QString's.
 class DomStyleWriter
 {
 public:
-    explicit DomStyleWriter(QString& out) : m_out(out) {}
+    explicit DomStyleWriter(std::u16string& out) : m_out(out) {}
 
     // "<name", indented for its level (1 for the node being written) unless it follows text.
     void openStartTag(QStringView name, int level, bool afterText);
@@ -34,8 +36,10 @@ public:
     void processingInstruction(QStringView target, QStringView data);
 
 private:
+    void put(QStringView piece) { m_out.append(piece.utf16(), std::size_t(piece.size())); }
+    void put(char16_t c) { m_out.push_back(c); }
     void indent(int level);
     void escaped(QStringView value, bool encodeQuotes, bool attributeValue);
 
-    QString& m_out;
+    std::u16string& m_out;
 };
