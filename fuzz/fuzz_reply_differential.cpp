@@ -2,13 +2,14 @@
 // the DOM splitter) and aborts when they disagree: whenever the scanner answers, XML2Json must
 // accept the text, each alarm map must equal XML2Json's rendering of that alarm and each "XML"
 // text the DOM splitter's. Also checks nodeToXml against QDomNode::save on every alarm.
+#include "../tests/support/DomReference.h"
+
 #include <AlarmListScanner.h>
 #include <AlarmXmlParser.h>
 #include <XML2Json.h>
 #include <XmlHelper.h>
 
 #include <QDomDocument>
-#include <QTextStream>
 
 #include <cstdint>
 #include <cstdio>
@@ -20,15 +21,6 @@ namespace {
 {
     std::fprintf(stderr, "readers disagree: %s\n%s\n", what, reply.toUtf8().constData());
     std::abort();
-}
-
-QString savedByDom(const QDomNode& node)
-{
-    QString xml;
-    QTextStream stream(&xml);
-    node.save(stream, 4);
-    stream.flush();
-    return xml;
 }
 
 void checkScanner(const QString& reply, const QVariantList& scanned)

@@ -1,12 +1,13 @@
 #include "support/AlarmReplies.h"
 
+#include "support/DomReference.h"
+
 #include <AlarmListScanner.h>
 #include <AlarmXmlParser.h>
 #include <XML2Json.h>
 #include <XmlHelper.h>
 
 #include <QDomDocument>
-#include <QTextStream>
 #include <QXmlStreamReader>
 #include <QtTest>
 
@@ -25,15 +26,6 @@ QString nested(const QString& name, int depth, const QString& inner = QString())
 {
     return QStringLiteral("<%1>").arg(name).repeated(depth) + inner +
            QStringLiteral("</%1>").arg(name).repeated(depth);
-}
-
-QString savedByDom(const QDomNode& node)
-{
-    QString xml;
-    QTextStream stream(&xml);
-    node.save(stream, 4);
-    stream.flush();
-    return xml;
 }
 
 // Levels of the node's subtree, the node itself being one, counted without recursion.

@@ -16,17 +16,21 @@ using namespace PluginAlarmSearchCommon;
 
 namespace {
 
-bool buildSearch(Cli& cli, const QCommandLineParser& parser, QString* method, QVariantMap* args,
-                 int* exitCode)
+// Builds the search from the filter options, opens the host and runs it (every window with
+// --all). On failure *exitCode holds the code to exit with.
+bool searchAlarms(Cli& cli, const QCommandLineParser& parser, QString* method, QVariantList* alarms,
+                  int* exitCode)
 {
     const QueryFilter filter = Cli::readFilter(parser);
+    QVariantMap args;
     QString error;
-    if (!QueryArguments::build(filter, QDateTime::currentDateTimeUtc(), args, &error)) {
+    if (!QueryArguments::build(filter, QDateTime::currentDateTimeUtc(), &args, &error)) {
         *exitCode = cli.usageError(error);
         return false;
     }
     *method = QueryArguments::method(filter);
-    return true;
+    return cli.openHost(exitCode) &&
+           runSearch(cli, *method, args, parser.isSet(QStringLiteral("all")), alarms, exitCode);
 }
 
 } // namespace
@@ -56,11 +60,8 @@ int query(Cli& cli, const QStringList& arguments)
         return cli.usageError(QStringLiteral("--format is json or table, not \"%1\"").arg(format));
 
     QString method;
-    QVariantMap args;
-    if (!buildSearch(cli, parser, &method, &args, &exitCode) || !cli.openHost(&exitCode))
-        return exitCode;
     QVariantList alarms;
-    if (!runSearch(cli, method, args, parser.isSet(QStringLiteral("all")), &alarms, &exitCode))
+    if (!searchAlarms(cli, parser, &method, &alarms, &exitCode))
         return exitCode;
 
     if (format == QLatin1String("table")) {
@@ -97,11 +98,8 @@ int exportAlarms(Cli& cli, const QStringList& arguments)
         return cli.usageError(QStringLiteral("--format is csv or json, not \"%1\"").arg(format));
 
     QString method;
-    QVariantMap args;
-    if (!buildSearch(cli, parser, &method, &args, &exitCode) || !cli.openHost(&exitCode))
-        return exitCode;
     QVariantList alarms;
-    if (!runSearch(cli, method, args, parser.isSet(QStringLiteral("all")), &alarms, &exitCode))
+    if (!searchAlarms(cli, parser, &method, &alarms, &exitCode))
         return exitCode;
 
     QList<ExportedAlarm> exported;
