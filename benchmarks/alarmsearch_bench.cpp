@@ -108,6 +108,30 @@ void BM_ReplyReadKeep(benchmark::State& state)
 }
 BENCHMARK(BM_ReplyReadKeep)->Apply(sizes);
 
+// What handing over an answer of this shape costs any reader: an alarm list as long as the
+// read's, each alarm a copy of one alarm map with its "XML" text allocated afresh, built and
+// destroyed with nothing read. The copies share their other values with that one alarm, so this
+// is a lower bound: what it adds per alarm from the smallest to the largest reply is growth no
+// reader can avoid (the memory of the answer itself: caches, and pages the heap hands back).
+void BM_AnswerFloor(benchmark::State& state)
+{
+    const QVariantList sample = readAnswer(replyOf(500)).toList();
+    const QVariantMap model = sample.value(sample.size() / 2).toMap();
+    const QString xmlKey = QStringLiteral("XML");
+    const QString xml = model.value(xmlKey).toString();
+    for (auto _ : state) {
+        QVariantList answer;
+        for (qsizetype i = 0; i < state.range(0); ++i) {
+            QVariantMap alarm = model;
+            alarm.insert(xmlKey, QString(xml.constData(), xml.size()));
+            answer.append(QVariant(std::move(alarm)));
+        }
+        benchmark::DoNotOptimize(answer.size());
+    }
+    setAlarmCounters(state);
+}
+BENCHMARK(BM_AnswerFloor)->Apply(sizes);
+
 void BM_GetAlarmList(benchmark::State& state)
 {
     const QString& reply = replyOf(state.range(0));
@@ -256,18 +280,28 @@ int main(int argc, char** argv)
     benchmark::RunSpecifiedBenchmarks(&reporter);
     benchmark::Shutdown();
 
+    // Microseconds per alarm of the fastest run, 0 when it did not run.
+    const auto perAlarm = [&reporter](const char* benchmark, const char* size) {
+        return reporter.fastest(std::string(benchmark) + '/' + size) * 1e6 / std::stod(size);
+    };
     std::printf("\n");
     for (const char* size : {"500", "5000", "50000"}) {
-        const double read = reporter.fastest(std::string("BM_ReplyRead/") + size);
-        const double bare = reporter.fastest(std::string("BM_BareStreamReader/") + size);
+        const double bare = perAlarm("BM_BareStreamReader", size);
+        const double read = perAlarm("BM_ReplyRead", size);
+        const double kept = perAlarm("BM_ReplyReadKeep", size);
         if (read > 0 && bare > 0)
-            std::printf("reply-read ratio %s: %.2f (%.2f us per alarm)\n", size, read / bare,
-                        read * 1e6 / std::stod(size));
-        const double kept = reporter.fastest(std::string("BM_ReplyReadKeep/") + size);
+            std::printf("reply-read ratio %s: %.2f (%.2f us per alarm)\n", size, read / bare, read);
         if (kept > 0 && bare > 0)
             std::printf("reply-read ratio %s, answer destroyed untimed: %.2f (%.2f us per "
                         "alarm)\n",
-                        size, kept / bare, kept * 1e6 / std::stod(size));
+                        size, kept / bare, kept);
+    }
+    for (const char* benchmark : {"BM_ReplyRead", "BM_AnswerFloor"}) {
+        const double small = perAlarm(benchmark, "500");
+        const double large = perAlarm(benchmark, "50000");
+        if (small > 0 && large > 0)
+            std::printf("%s per alarm, 500 -> 50000: %.2f -> %.2f us (%.2fx, +%.2f us)\n",
+                        benchmark, small, large, large / small, large - small);
     }
     const double replyKiB = double(memoryReply.size()) * sizeof(QChar) / 1024;
     std::printf("peak memory of one 5000-alarm read: %ld KiB over a reply of %.0f KiB "
