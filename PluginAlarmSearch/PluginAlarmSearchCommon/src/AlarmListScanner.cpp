@@ -524,7 +524,7 @@ private:
     void finishAlarmText(bool beforeText)
     {
         DomStyleWriter(m_xml).lineBreak(beforeText);
-        m_alarm.insert(XmlKey, QStringView(m_xml).toString());
+        m_alarm.insert(XmlKey, m_xml.view().toString());
         m_alarms.append(QVariant(std::move(m_alarm)));
         m_alarm = QVariantMap();
         m_alarmPending = false;
@@ -674,7 +674,7 @@ private:
     QVariantList m_alarms;
     // The alarm read last, its text in m_xml still without its line break, while m_alarmPending.
     QVariantMap m_alarm;
-    std::u16string m_xml;
+    Utf16Buffer m_xml;
     bool m_alarmPending = false;
     std::vector<QString> m_keys{TextKey};
     std::vector<int> m_keyRanks{0};

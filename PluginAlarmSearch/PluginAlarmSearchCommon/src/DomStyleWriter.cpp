@@ -8,7 +8,7 @@ constexpr int IndentWidth = 4;
 
 void DomStyleWriter::indent(int level)
 {
-    m_out.append(std::size_t(level) * IndentWidth, u' ');
+    m_out.fill(std::size_t(level) * IndentWidth, u' ');
 }
 
 void DomStyleWriter::openStartTag(QStringView name, int level, bool afterText)

@@ -21,7 +21,7 @@ class DomNodeWriter
 public:
     enum class Outcome { Written, TooDeep, Unsupported };
 
-    explicit DomNodeWriter(std::u16string& out) : m_writer(out) {}
+    explicit DomNodeWriter(Utf16Buffer& out) : m_writer(out) {}
 
     Outcome write(const QDomNode& top)
     {
@@ -150,10 +150,10 @@ QString XmlHelper::nodeToXml(const QDomNode& node)
 {
     if (node.isNull())
         return QString();
-    std::u16string xml;
+    Utf16Buffer xml;
     switch (DomNodeWriter(xml).write(node)) {
     case DomNodeWriter::Outcome::Written:
-        return QStringView(xml).toString();
+        return xml.view().toString();
     case DomNodeWriter::Outcome::TooDeep:
         return QString();
     case DomNodeWriter::Outcome::Unsupported:
