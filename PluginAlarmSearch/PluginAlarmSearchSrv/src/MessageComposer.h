@@ -6,12 +6,12 @@
 #include <QVariant>
 
 // Writes the XML commands sent to the management server: no XML declaration, no white space
-// between elements. Holds no state; any number of calls may run at once.
+// between elements. Holds no state; any number of calls may run at once. Its virtual
+// operations are the whole of its vtable, in this order, for composers built elsewhere; owners
+// hold it through a QSharedPointer, which deletes a derived composer as what it was created as.
 class MessageComposer
 {
 public:
-    virtual ~MessageComposer() = default;
-
     // "QryAlarmList": trigger events, state filter, name rules and the UTC time bound of the
     // request map in args; newest first, at most 5000 records.
     virtual QString composeQueryAlarmListMessage(const QVariant& args);

@@ -75,8 +75,6 @@ ORVOSrvTunnelControl::ORVOSrvTunnelControl(IOrvoTunnelClient* client)
 {
 }
 
-ORVOSrvTunnelControl::~ORVOSrvTunnelControl() = default;
-
 void ORVOSrvTunnelControl::setMessageComposer(QSharedPointer<MessageComposer> composer)
 {
     m_spMessageComposer = std::move(composer);

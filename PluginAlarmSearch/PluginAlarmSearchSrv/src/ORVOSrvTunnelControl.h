@@ -17,7 +17,9 @@ class MessageComposer;
 //
 // The reply readers are static: a reply callback holds only its own copy of the completion, so
 // the tunnel client may call it from any thread, any number of times, even after this object
-// is gone.
+// is gone. Its virtual operations are the whole of its vtable, in this order, for controls built
+// elsewhere; owners hold it through a QSharedPointer, which deletes a derived control as what it
+// was created as.
 class ORVOSrvTunnelControl
 {
 public:
@@ -30,7 +32,6 @@ public:
         std::function<void(bool ok, bool isLast, const QVariant& result, const QString& relayPath)>;
 
     explicit ORVOSrvTunnelControl(IOrvoTunnelClient* client);
-    virtual ~ORVOSrvTunnelControl();
 
     void setMessageComposer(QSharedPointer<MessageComposer> composer);
 
