@@ -472,6 +472,42 @@ private slots:
         QCOMPARE(f.host.journal(), QStringList{"answer 0"});
     }
 
+    // The host may delete the plug-in from inside a callback of an update's reply, on the thread
+    // that delivers it: the deletion does not wait for that reply, whose remaining subscribers
+    // and client are still served.
+    void deletionFromInsideAnUpdateReply_data()
+    {
+        QTest::addColumn<bool>("inEvent");
+        QTest::newRow("event callback") << true;
+        QTest::newRow("answer callback") << false;
+    }
+
+    void deletionFromInsideAnUpdateReply()
+    {
+        QFETCH(bool, inEvent);
+        Fixture f(false);
+        const HDLR_EVENT_SIGNAL_CB recordEvent = f.host.eventSignal;
+        f.host.eventSignal = [&](const PluginObjBase_EventSignalInfo* info) {
+            recordEvent(info);
+            if (inEvent)
+                f.plugin.reset();
+        };
+        f.plugin->InitialPluginBase(&f.host);
+        f.subscribe("k1");
+        f.subscribe("k2");
+        const HDLR_DO_REQUEST_CB recordAnswer = f.host.answerSink();
+        f.plugin->Request(
+            METHOD_UPDATE_ALARM, QVariantMap{{ARG_ALARM_ID_LIST, QStringList{"A1"}}}, senderInfo(),
+            [&](bool isLast, const QString& code, const QString& message, const QVariant& result) {
+                recordAnswer(isLast, code, message, result);
+                f.plugin.reset();
+            });
+        f.host.tunnel.replyOnThread({true, "", "0", processReply, true});
+
+        QVERIFY(!f.plugin);
+        QCOMPARE(f.host.journal(), (QStringList{"event k1", "event k2", "answer 0"}));
+    }
+
     void metaObject()
     {
         PluginAlarmSearchSrv plugin;

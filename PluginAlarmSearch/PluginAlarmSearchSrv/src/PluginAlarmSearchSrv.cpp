@@ -7,13 +7,46 @@
 #include <IFrameworkTools.h>
 #include <RequestSenderInfo.h>
 
+#include <algorithm>
+#include <vector>
+
 using namespace PluginAlarmSearchCommon;
 
 namespace {
 
 void ignoreAnswer(bool, const QString&, const QString&, const QVariant&) {}
 
+// The guards the calling thread is visiting, once per visit (visits nest when a callback makes a
+// request that is answered at once).
+thread_local std::vector<const PluginLifeGuard*> t_visiting;
+
 } // namespace
+
+PluginAlarmSearchSrv* PluginLifeGuard::enter()
+{
+    std::lock_guard lock(m_mutex);
+    if (!m_plugin)
+        return nullptr;
+    ++m_visits;
+    t_visiting.push_back(this);
+    return m_plugin;
+}
+
+void PluginLifeGuard::leave()
+{
+    t_visiting.erase(std::find(t_visiting.begin(), t_visiting.end(), this));
+    std::lock_guard lock(m_mutex);
+    --m_visits;
+    m_idle.notify_all();
+}
+
+void PluginLifeGuard::retire()
+{
+    const auto own = std::count(t_visiting.cbegin(), t_visiting.cend(), this);
+    std::unique_lock lock(m_mutex);
+    m_plugin = nullptr;
+    m_idle.wait(lock, [&] { return m_visits == own; });
+}
 
 PluginAlarmSearchSrv::PluginAlarmSearchSrv()
     : m_lifeGuard(QSharedPointer<PluginLifeGuard>::create(this))

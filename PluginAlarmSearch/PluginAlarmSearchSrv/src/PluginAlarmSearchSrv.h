@@ -5,15 +5,17 @@
 #include <QSharedPointer>
 #include <QStringList>
 
+#include <condition_variable>
 #include <mutex>
-#include <shared_mutex>
 
 class ORVOSrvTunnelControl;
 class PluginAlarmSearchSrv;
 
 // Lets completions that outlive their request reach the plug-in object only while it exists.
-// A completion holds the guard for as long as it runs; the plug-in's destructor retires the
-// guard, waiting for running completions, after which none reaches the object any more.
+// The plug-in's destructor retires the guard: it waits for the visits running on other threads,
+// and no visit starts afterwards. A visit on the destroying thread itself is not waited for, so
+// the host may delete the plug-in from inside a callback the plug-in is calling; the visitor
+// then touches the object no more after that call.
 class PluginLifeGuard
 {
 public:
@@ -21,20 +23,28 @@ public:
 
     template <typename Visitor> void visit(Visitor&& visitor)
     {
-        std::shared_lock lock(m_mutex);
-        if (m_plugin)
-            visitor(m_plugin);
+        PluginAlarmSearchSrv* const plugin = enter();
+        if (!plugin)
+            return;
+        const struct Leave
+        {
+            PluginLifeGuard& guard;
+            ~Leave() { guard.leave(); }
+        } leave{*this};
+        visitor(plugin);
     }
 
-    void retire()
-    {
-        std::unique_lock lock(m_mutex);
-        m_plugin = nullptr;
-    }
+    void retire();
 
 private:
-    std::shared_mutex m_mutex;
+    // The plug-in, counted as visited by this thread, or null once retired.
+    PluginAlarmSearchSrv* enter();
+    void leave();
+
+    std::mutex m_mutex;
+    std::condition_variable m_idle;
     PluginAlarmSearchSrv* m_plugin;
+    int m_visits = 0;
 };
 
 // The plug-in object the host talks to: starts with the host's services, routes each client
