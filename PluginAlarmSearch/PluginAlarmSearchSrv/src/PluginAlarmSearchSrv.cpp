@@ -7,42 +7,43 @@
 #include <IFrameworkTools.h>
 #include <RequestSenderInfo.h>
 
-#include <algorithm>
-#include <vector>
-
 using namespace PluginAlarmSearchCommon;
 
 namespace {
 
 void ignoreAnswer(bool, const QString&, const QString&, const QVariant&) {}
 
-// The guards the calling thread is visiting, once per visit (visits nest when a callback makes a
-// request that is answered at once).
-thread_local std::vector<const PluginLifeGuard*> t_visiting;
-
 } // namespace
 
-PluginAlarmSearchSrv* PluginLifeGuard::enter()
+thread_local const PluginLifeGuard::Visit* PluginLifeGuard::t_innermostVisit = nullptr;
+
+PluginLifeGuard::Visit::Visit(PluginLifeGuard& guard)
+    : m_guard(guard), m_plugin(nullptr), m_outer(t_innermostVisit)
 {
-    std::lock_guard lock(m_mutex);
-    if (!m_plugin)
-        return nullptr;
-    ++m_visits;
-    t_visiting.push_back(this);
-    return m_plugin;
+    std::lock_guard lock(m_guard.m_mutex);
+    if (!m_guard.m_plugin)
+        return;
+    m_plugin = m_guard.m_plugin;
+    ++m_guard.m_visits;
+    t_innermostVisit = this;
 }
 
-void PluginLifeGuard::leave()
+PluginLifeGuard::Visit::~Visit()
 {
-    t_visiting.erase(std::find(t_visiting.begin(), t_visiting.end(), this));
-    std::lock_guard lock(m_mutex);
-    --m_visits;
-    m_idle.notify_all();
+    if (!m_plugin)
+        return;
+    t_innermostVisit = m_outer;
+    std::lock_guard lock(m_guard.m_mutex);
+    --m_guard.m_visits;
+    m_guard.m_idle.notify_all();
 }
 
 void PluginLifeGuard::retire()
 {
-    const auto own = std::count(t_visiting.cbegin(), t_visiting.cend(), this);
+    // Visits on this thread (the host deletes the plug-in from inside one) are not waited for.
+    int own = 0;
+    for (const Visit* visit = t_innermostVisit; visit; visit = visit->m_outer)
+        own += &visit->m_guard == this ? 1 : 0;
     std::unique_lock lock(m_mutex);
     m_plugin = nullptr;
     m_idle.wait(lock, [&] { return m_visits == own; });

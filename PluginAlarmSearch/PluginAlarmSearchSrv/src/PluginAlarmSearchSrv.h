@@ -23,23 +23,38 @@ public:
 
     template <typename Visitor> void visit(Visitor&& visitor)
     {
-        PluginAlarmSearchSrv* const plugin = enter();
-        if (!plugin)
-            return;
-        const struct Leave
-        {
-            PluginLifeGuard& guard;
-            ~Leave() { guard.leave(); }
-        } leave{*this};
-        visitor(plugin);
+        const Visit visit(*this);
+        if (visit.plugin())
+            visitor(visit.plugin());
     }
 
     void retire();
 
 private:
-    // The plug-in, counted as visited by this thread, or null once retired.
-    PluginAlarmSearchSrv* enter();
-    void leave();
+    // One visit, on the stack of the visiting thread, which keeps a chain of its visits (they
+    // nest when a callback makes a request that is answered at once).
+    class Visit
+    {
+    public:
+        explicit Visit(PluginLifeGuard& guard);
+        ~Visit();
+        Visit(const Visit&) = delete;
+        Visit& operator=(const Visit&) = delete;
+
+        // The plug-in, or null when the guard was already retired.
+        PluginAlarmSearchSrv* plugin() const { return m_plugin; }
+
+    private:
+        friend class PluginLifeGuard;
+
+        PluginLifeGuard& m_guard;
+        PluginAlarmSearchSrv* m_plugin;
+        const Visit* m_outer;
+    };
+
+    // The calling thread's innermost visit of any guard. A plain pointer: it needs no
+    // destructor at thread exit, which would keep the library from being unloaded.
+    static thread_local const Visit* t_innermostVisit;
 
     std::mutex m_mutex;
     std::condition_variable m_idle;
