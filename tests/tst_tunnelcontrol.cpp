@@ -7,8 +7,15 @@
 #include <QtTest>
 
 #include <thread>
+#include <type_traits>
 
 using namespace PluginAlarmSearchCommon;
+
+// Both vtables hold just the four operations, in order, for classes built against that layout.
+static_assert(std::is_polymorphic_v<MessageComposer> &&
+              !std::has_virtual_destructor_v<MessageComposer>);
+static_assert(std::is_polymorphic_v<ORVOSrvTunnelControl> &&
+              !std::has_virtual_destructor_v<ORVOSrvTunnelControl>);
 
 namespace {
 
