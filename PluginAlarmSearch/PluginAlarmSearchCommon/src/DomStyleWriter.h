@@ -16,6 +16,8 @@ public:
 
     void append(const char16_t* piece, std::size_t length)
     {
+        if (length == 0)
+            return; // an empty piece may have no data at all, which memcpy must not be given
         std::memcpy(room(length), piece, length * sizeof(char16_t));
         m_size += length;
     }
