@@ -413,6 +413,21 @@ private:
         return true;
     }
 
+    enum class Markup { ChildStart, EndTag, Fault };
+
+    // At the markup after an element's text: a child's start tag (left just past its "<") or
+    // the end tag of the element being read (left just past it).
+    Markup markupAfterText(QStringView elementName)
+    {
+        if (m_pos == m_end)
+            return Markup::Fault;
+        ++m_pos;
+        if (!at(u'/'))
+            return Markup::ChildStart;
+        ++m_pos;
+        return endTag(elementName) ? Markup::EndTag : Markup::Fault;
+    }
+
     // After "<": an element at the given depth below the document element, kept in m_nodes when
     // keep is set and only checked otherwise.
     bool element(int depth, bool keep)
@@ -444,15 +459,11 @@ private:
                 node.blank = run.blank;
                 m_nodes.push_back(std::move(node));
             }
-            if (m_pos == m_end)
+            const Markup next = markupAfterText(elementName);
+            if (next == Markup::Fault)
                 return false;
-            ++m_pos;
-            if (at(u'/')) {
-                ++m_pos;
-                if (!endTag(elementName))
-                    return false;
+            if (next == Markup::EndTag)
                 break;
-            }
             if (depth == XML2Json::MaxDepth || !element(depth + 1, keep))
                 return false;
         }
@@ -480,15 +491,11 @@ private:
             const bool afterText = !run.blank;
             if (m_alarmPending)
                 finishAlarmText(afterText);
-            if (m_pos == m_end)
+            const Markup next = markupAfterText(elementName);
+            if (next == Markup::Fault)
                 return false;
-            ++m_pos;
-            if (at(u'/')) {
-                ++m_pos;
-                if (!endTag(elementName))
-                    return false;
+            if (next == Markup::EndTag)
                 break;
-            }
             const char16_t* const childStart = m_pos;
             QStringView childName;
             const bool isAlarm = isReply && name(childName) && childName == AlarmName;
