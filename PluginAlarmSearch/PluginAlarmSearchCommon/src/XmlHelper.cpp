@@ -15,38 +15,51 @@ bool isTextNode(const QDomNode& node)
     return node.isText(); // also true for CDATA sections, as QDomNode::save sees them
 }
 
-// Writes the subtree below a node iteratively.
+enum class Walk { Done, TooDeep, Stopped };
+
+// Walks the subtree below top in document order without recursion, top at level 1:
+// enter(node, level) comes before a node's children and stops the walk by returning false;
+// leave(node, level) comes after the children of a node that has some. A level deeper than
+// XmlHelper::MaxDepth stops the walk too.
+template <typename Enter, typename Leave>
+Walk walkSubtree(const QDomNode& top, Enter&& enter, Leave&& leave)
+{
+    QDomNode node = top;
+    int level = 1;
+    for (;;) {
+        if (level > XmlHelper::MaxDepth)
+            return Walk::TooDeep;
+        if (!enter(node, level))
+            return Walk::Stopped;
+        if (node.hasChildNodes()) {
+            node = node.firstChild();
+            ++level;
+            continue;
+        }
+        // Climb to the next node to enter, leaving the nodes that end on the way.
+        while (node != top && node.nextSibling().isNull()) {
+            node = node.parentNode();
+            --level;
+            leave(node, level);
+        }
+        if (node == top)
+            return Walk::Done;
+        node = node.nextSibling();
+    }
+}
+
+// Writes the subtree below a node iteratively; the walk stops at a node it does not write.
 class DomNodeWriter
 {
 public:
-    enum class Outcome { Written, TooDeep, Unsupported };
-
     explicit DomNodeWriter(Utf16Buffer& out) : m_writer(out) {}
 
-    Outcome write(const QDomNode& top)
+    Walk write(const QDomNode& top)
     {
-        QDomNode node = top;
-        int level = 1;
-        for (;;) {
-            if (level > XmlHelper::MaxDepth)
-                return Outcome::TooDeep;
-            if (!enter(node, level))
-                return Outcome::Unsupported;
-            if (node.isElement() && node.hasChildNodes()) {
-                node = node.firstChild();
-                ++level;
-                continue;
-            }
-            // Climb to the next node to enter, closing the elements that end on the way.
-            while (node != top && node.nextSibling().isNull()) {
-                node = node.parentNode();
-                --level;
-                leaveElement(node.toElement(), level);
-            }
-            if (node == top)
-                return Outcome::Written;
-            node = node.nextSibling();
-        }
+        // Only elements among the nodes written have children, so only elements are left.
+        return walkSubtree(
+            top, [this](const QDomNode& node, int level) { return enter(node, level); },
+            [this](const QDomNode& node, int level) { leaveElement(node.toElement(), level); });
     }
 
 private:
@@ -103,27 +116,12 @@ private:
     DomStyleWriter m_writer;
 };
 
-// Levels of the subtree below node, counted without recursion up to just past the bound.
-bool withinDepth(const QDomNode& top)
+// Whether the subtree below node is no deeper than XmlHelper::MaxDepth, found without recursion.
+bool withinDepth(const QDomNode& node)
 {
-    QDomNode node = top;
-    int level = 1;
-    for (;;) {
-        if (level > XmlHelper::MaxDepth)
-            return false;
-        if (node.hasChildNodes()) {
-            node = node.firstChild();
-            ++level;
-            continue;
-        }
-        while (node != top && node.nextSibling().isNull()) {
-            node = node.parentNode();
-            --level;
-        }
-        if (node == top)
-            return true;
-        node = node.nextSibling();
-    }
+    return walkSubtree(
+               node, [](const QDomNode&, int) { return true; }, [](const QDomNode&, int) {}) !=
+           Walk::TooDeep;
 }
 
 QString savedByDom(const QDomNode& node)
@@ -152,11 +150,11 @@ QString XmlHelper::nodeToXml(const QDomNode& node)
         return QString();
     Utf16Buffer xml;
     switch (DomNodeWriter(xml).write(node)) {
-    case DomNodeWriter::Outcome::Written:
+    case Walk::Done:
         return xml.view().toString();
-    case DomNodeWriter::Outcome::TooDeep:
+    case Walk::TooDeep:
         return QString();
-    case DomNodeWriter::Outcome::Unsupported:
+    case Walk::Stopped:
         break;
     }
     return withinDepth(node) ? savedByDom(node) : QString();
