@@ -6,7 +6,7 @@ set -euo pipefail
 packages=(
     cmake ninja-build g++ pkg-config
     qt6-base-dev libqt6sql6-sqlite
-    libpugixml-dev libbenchmark-dev
+    libbenchmark-dev
     clang-14 libclang-rt-14-dev
 )
 
