@@ -20,7 +20,8 @@ const int kDefaultTimeoutSeconds = 30;
 Cli::Cli()
     : m_pluginOption(QStringLiteral("plugin"),
                      QStringLiteral("Plug-in file to load (default: $ALARMSEARCH_PLUGIN, else "
-                                    "../plugins/libPluginAlarmSearchSrv.so beside this program)."),
+                                    "the installed plug-in, " ALARMSEARCH_PLUGIN_RELATIVE_DIR
+                                    "/libPluginAlarmSearchSrv.so from this program's folder)."),
                      QStringLiteral("path")),
       m_serverOption(QStringLiteral("server"),
                      QStringLiteral("Talk to a running alarmsearch-sim over TCP instead of the "

@@ -27,14 +27,16 @@ QString PluginLoader::defaultPluginPath()
     const QString fromEnvironment = qEnvironmentVariable(kPluginEnvironmentVariable);
     if (!fromEnvironment.isEmpty())
         return fromEnvironment;
-    return QCoreApplication::applicationDirPath() + QStringLiteral("/../plugins/") +
-           QLatin1String(kPluginFileName);
+    return QCoreApplication::applicationDirPath() +
+           QLatin1String("/" ALARMSEARCH_PLUGIN_RELATIVE_DIR "/") + QLatin1String(kPluginFileName);
 }
 
 QString PluginLoader::failure(const QString& reason) const
 {
     const QString detail = m_loader.errorString().simplified();
-    return QStringLiteral("cannot load plug-in %1: %2 (%3)").arg(m_fileName, reason, detail);
+    return QStringLiteral("cannot load plug-in %1: %2 (%3); name the plug-in file with --plugin "
+                          "or %4")
+        .arg(m_fileName, reason, detail, QLatin1String(kPluginEnvironmentVariable));
 }
 
 bool PluginLoader::load(const QString& fileName, QString* errorMessage)

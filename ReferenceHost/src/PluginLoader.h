@@ -16,13 +16,14 @@ public:
     PluginLoader(const PluginLoader&) = delete;
     PluginLoader& operator=(const PluginLoader&) = delete;
 
-    // On failure errorMessage gets one line naming the file and the reason.
+    // On failure errorMessage gets one line naming the file, the reason and how to name another.
     bool load(const QString& fileName, QString* errorMessage);
 
     IPluginObjectBase* plugin() const { return m_plugin; }
     QString pluginId() const { return m_pluginId; }
 
-    // $ALARMSEARCH_PLUGIN, else the plug-in beside the running executable's bin folder.
+    // $ALARMSEARCH_PLUGIN, else the plug-in in the installed plug-in folder, found relative to
+    // the running executable's folder.
     static QString defaultPluginPath();
 
 private:
