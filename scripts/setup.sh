@@ -8,6 +8,7 @@ packages=(
     qt6-base-dev libqt6sql6-sqlite
     libbenchmark-dev
     clang-14 libclang-rt-14-dev
+    help2man
 )
 
 missing=()
