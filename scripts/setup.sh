@@ -1,5 +1,6 @@
 #!/usr/bin/env bash
-# Installs the Debian packages the build, the tests, the benchmarks and the fuzz targets need.
+# Installs the Debian packages the build, the tests, the benchmarks, the fuzz targets and the
+# Debian packages' making and checking need.
 # Does nothing when all of them are present, so it is cheap to run before every build.
 set -euo pipefail
 
@@ -8,7 +9,7 @@ packages=(
     qt6-base-dev libqt6sql6-sqlite
     libbenchmark-dev
     clang-14 libclang-rt-14-dev
-    help2man
+    help2man dpkg-dev lintian
 )
 
 missing=()
