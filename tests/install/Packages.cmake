@@ -1,6 +1,6 @@
 # Builds the Debian packages of the build tree and checks them: each one's files (mode, owner,
 # path) against expected/<package>.contents, no file carrying a path of the source or build tree,
-# and no error from lintian.
+# the unpacked alarmsearch running its demo, and no error from lintian.
 #   BUILD_DIR, SOURCE_DIR, WORK_DIR, EXPECTED_DIR, PACKAGES
 file(REMOVE_RECURSE ${WORK_DIR})
 execute_process(COMMAND cpack -G DEB -B ${WORK_DIR} --config ${BUILD_DIR}/CPackConfig.cmake
@@ -24,18 +24,23 @@ foreach(package ${PACKAGES})
     if(NOT listing STREQUAL expected)
         message(SEND_ERROR "${package} holds:\n${listing}\nexpected:\n${expected}")
     endif()
-
-    set(root ${WORK_DIR}/root/${package})
-    file(MAKE_DIRECTORY ${root})
-    execute_process(COMMAND dpkg-deb -x ${deb} ${root} COMMAND_ERROR_IS_FATAL ANY)
-    file(GLOB_RECURSE files ${root}/*)
-    foreach(file ${files})
-        file(STRINGS ${file} hits REGEX "${sourcePattern}")
-        if(hits)
-            message(SEND_ERROR "${file} names the source tree: ${hits}")
-        endif()
-    endforeach()
+    execute_process(COMMAND dpkg-deb -x ${deb} ${WORK_DIR}/root COMMAND_ERROR_IS_FATAL ANY)
 endforeach()
+
+file(GLOB_RECURSE files ${WORK_DIR}/root/*)
+foreach(file ${files})
+    file(STRINGS ${file} hits REGEX "${sourcePattern}")
+    if(hits)
+        message(SEND_ERROR "${file} names the source tree: ${hits}")
+    endif()
+endforeach()
+
+# The packaged alarmsearch, unpacked, finds the packaged plug-in by itself.
+execute_process(COMMAND env -i ${WORK_DIR}/root/usr/bin/alarmsearch demo
+                RESULT_VARIABLE exitCode OUTPUT_QUIET ERROR_VARIABLE errors)
+if(NOT exitCode EQUAL 0)
+    message(SEND_ERROR "the packaged alarmsearch demo failed (${exitCode}): ${errors}")
+endif()
 
 execute_process(COMMAND lintian --fail-on error ${debs} RESULT_VARIABLE exitCode
                 OUTPUT_VARIABLE verdict ERROR_VARIABLE verdict)
