@@ -21,6 +21,7 @@ const QString kStatusOk = QStringLiteral("0");
 const QString kStatusBadCommand = QStringLiteral("80000001");
 const QString kStatusUnknownMethod = QStringLiteral("80000002");
 const QString kStatusServerError = QStringLiteral("80000003");
+const QString kStatusUnknownAlarm = QStringLiteral("80000004");
 
 const QString kResultOk = QStringLiteral("0");
 const QString kResultUnknownAlarm = QStringLiteral("1");
@@ -276,7 +277,7 @@ CommandReply AlarmServer::Private::processAlarm(QSqlDatabase db, const XmlElemen
 
 CommandReply AlarmServer::Private::getAlarmInfo(QSqlDatabase db, const XmlElement& command)
 {
-    const CommandReply unknownAlarm = ok(QStringLiteral("<GetAlarmInfoRes/>"));
+    const CommandReply unknownAlarm{kStatusUnknownAlarm, QString()};
     const std::optional<qint64> number = parseAlarmId(command.childText(u"AlarmID"));
     if (!number)
         return unknownAlarm;
