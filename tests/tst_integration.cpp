@@ -328,7 +328,13 @@ private slots:
         });
         QVariantList all;
         QString error;
-        QVERIFY(pager.fetchAll(QVariantMap(), &all, &error));
+        QVERIFY(pager.fetchAll(
+            QVariantMap(),
+            [&all](const QVariantList& page, QString*) {
+                all += page;
+                return true;
+            },
+            &error));
         QCOMPARE(pager.pages(), 3);
         QCOMPARE(all.size(), seedCount);
         QCOMPARE(all.mid(0, capped.size()), capped); // the newest first, as one search gives them
