@@ -4,7 +4,7 @@
 set -euo pipefail
 
 packages=(
-    cmake ninja-build g++ pkg-config
+    cmake ninja-build g++ pkg-config time
     qt6-base-dev libqt6sql6-sqlite libutf8proc-dev
     libpugixml-dev libbenchmark-dev
     clang-14 libclang-rt-14-dev

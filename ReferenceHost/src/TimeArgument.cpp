@@ -56,8 +56,10 @@ QString TimeArgument::toServerTime(const QDateTime& time)
 
 QString TimeArgument::display(const QString& serverTime, const QTimeZone& zone)
 {
-    QDateTime time = QDateTime::fromString(serverTime, Qt::ISODate);
-    if (!time.isValid() || !zone.isValid() || zone == QTimeZone::utc())
+    if (!zone.isValid() || zone == QTimeZone::utc())
+        return serverTime;
+    const QDateTime time = QDateTime::fromString(serverTime, Qt::ISODate);
+    if (!time.isValid())
         return serverTime;
     return time.toTimeZone(zone).toString(Qt::ISODate);
 }
