@@ -48,43 +48,58 @@ bool prepareSearch(Cli& cli, const QCommandLineParser& parser, QString* method, 
     return cli.openHost(exitCode);
 }
 
-// Fetches the change histories of one page of alarms with a bounded number of requests in
-// flight, and hands each alarm on with its history in the page's order.
+// Fetches the change histories of the alarms of a search with a bounded number of requests in
+// flight, and hands each alarm on with its history in the search's order. The histories of a
+// page are fetched while the next page is searched for; at most two pages are held.
 class HistoryFetcher
 {
 public:
     using Writer = std::function<bool(const ExportedAlarm& exported, QString* errorMessage)>;
 
-    explicit HistoryFetcher(Cli& cli) : m_cli(cli)
+    HistoryFetcher(Cli& cli, Writer write) : m_cli(cli), m_write(std::move(write))
     {
         m_pool.setMaxThreadCount(kHistoryRequestsInFlight);
     }
-
-    bool fetchPage(const QVariantList& alarms, const Writer& write, QString* errorMessage)
+    ~HistoryFetcher()
     {
-        std::vector<Slot> results(size_t(alarms.size()));
-        std::atomic<bool> stop{false};
-        for (size_t i = 0; i < results.size(); ++i) {
+        m_stop = true;
+        m_pool.waitForDone();
+    }
+
+    // Writes the alarms of the page started before, then starts fetching this page's histories.
+    bool addPage(const QVariantList& alarms, QString* errorMessage)
+    {
+        if (!writePage(errorMessage))
+            return false;
+        m_page = alarms;
+        m_results = std::vector<Slot>(size_t(alarms.size()));
+        for (size_t i = 0; i < m_results.size(); ++i) {
             const QString id =
                 alarms[qsizetype(i)].toMap().value(QStringLiteral("AlarmID")).toString();
-            m_pool.start([this, &results, &stop, i, id] {
+            m_pool.start([this, i, id] {
                 Slot result;
-                if (!stop)
+                if (!m_stop)
                     result.ok = fetch(id, &result.history, &result.error);
                 QMutexLocker locker(&m_mutex);
-                results[i] = std::move(result);
-                results[i].done = true;
+                m_results[i] = std::move(result);
+                m_results[i].done = true;
                 m_done.wakeAll();
             });
         }
+        return true;
+    }
+
+    // Writes the alarms of the last page started, in order, as their histories arrive.
+    bool writePage(QString* errorMessage)
+    {
         bool ok = true;
-        for (size_t i = 0; ok && i < results.size(); ++i) {
+        for (size_t i = 0; ok && i < m_results.size(); ++i) {
             Slot slot;
             {
                 QMutexLocker locker(&m_mutex);
-                while (!results[i].done)
+                while (!m_results[i].done)
                     m_done.wait(&m_mutex);
-                slot = std::move(results[i]);
+                slot = std::move(m_results[i]);
             }
             if (interrupted()) {
                 *errorMessage = QStringLiteral("interrupted");
@@ -93,11 +108,14 @@ public:
                 *errorMessage = slot.error;
                 ok = false;
             } else {
-                ok = write(ExportedAlarm{alarms[qsizetype(i)].toMap(), slot.history}, errorMessage);
+                ok = m_write(ExportedAlarm{m_page[qsizetype(i)].toMap(), slot.history},
+                             errorMessage);
             }
         }
-        stop = true;
+        m_stop = !ok;
         m_pool.waitForDone();
+        m_results.clear();
+        m_page.clear();
         return ok;
     }
 
@@ -129,9 +147,13 @@ private:
     }
 
     Cli& m_cli;
-    QThreadPool m_pool;
+    Writer m_write;
+    QVariantList m_page;
+    std::vector<Slot> m_results;
+    std::atomic<bool> m_stop{false};
     QMutex m_mutex;
     QWaitCondition m_done;
+    QThreadPool m_pool; // last: destroyed first, once its tasks are done with the members above
 };
 
 } // namespace
@@ -264,9 +286,8 @@ int exportAlarms(Cli& cli, const QStringList& arguments)
     bool truncated = false;
     {
         ProgressBar progress(QStringLiteral("exported"), -1, !output.isTerminal());
-        HistoryFetcher fetcher(cli);
         QByteArray chunk;
-        const HistoryFetcher::Writer write = [&](const ExportedAlarm& alarm, QString* writeError) {
+        HistoryFetcher fetcher(cli, [&](const ExportedAlarm& alarm, QString* writeError) {
             chunk += writer.alarm(alarm);
             ++exported;
             progress.advance();
@@ -274,13 +295,14 @@ int exportAlarms(Cli& cli, const QStringList& arguments)
                 return true;
             const QByteArray bytes = std::exchange(chunk, QByteArray());
             return output.write(bytes, writeError);
-        };
+        });
         const AlarmPager::PageSink sink = [&](const QVariantList& page, QString* sinkError) {
-            return fetcher.fetchPage(page, write, sinkError) &&
-                   output.write(std::exchange(chunk, QByteArray()), sinkError);
+            return fetcher.addPage(page, sinkError);
         };
         if (!runSearch(cli, method, args, true, sink, &truncated, &exitCode))
             return exitCode;
+        if (!fetcher.writePage(&error) || !output.write(chunk, &error))
+            return cli.fail(error);
     }
     if (truncated)
         return cli.fail(QStringLiteral("export incomplete, nothing written: the range holds "
