@@ -483,9 +483,10 @@ private slots:
                                   db, QStringLiteral("--seed-count"), QStringLiteral("5100")} +
                           arguments);
             cli.closeWriteChannel();
-            if (!cli.waitForFinished(120000) || cli.exitCode() != 0)
-                qFatal("%s failed: %s", qPrintable(arguments.join(u' ')),
-                       cli.readAllStandardError().constData());
+            // Generous: sanitizer builds on a busy machine are many times slower.
+            if (!cli.waitForFinished(600000) || cli.exitCode() != 0)
+                qFatal("%s failed (exit code %d): %s", qPrintable(arguments.join(u' ')),
+                       cli.exitCode(), cli.readAllStandardError().constData());
             if (err)
                 *err = cli.readAllStandardError();
             return cli.readAllStandardOutput();
