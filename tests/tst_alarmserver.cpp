@@ -357,9 +357,10 @@ private slots:
         QCOMPARE(elementsOf(infoText, QStringLiteral("Entry")).last()["Note"],
                  QStringLiteral("second look"));
 
-        QCOMPARE(
-            m_server->execute(QStringLiteral("GetAlarmInfo"), infoCommand("A9999999")).replyText,
-            QStringLiteral("<GetAlarmInfoRes/>"));
+        const CommandReply unknown =
+            m_server->execute(QStringLiteral("GetAlarmInfo"), infoCommand("A9999999"));
+        QCOMPARE(unknown.statusText, QStringLiteral("80000004"));
+        QCOMPARE(unknown.replyText, QString());
         m_all = query(*m_server, queryCommand());
     }
 

@@ -1,6 +1,9 @@
 #include <AlarmPager.h>
+#include <AlarmTable.h>
+#include <BatchRequest.h>
 #include <ExportWriter.h>
 #include <QueryArguments.h>
+#include <SearchWriter.h>
 #include <TimeArgument.h>
 
 #include <PluginAlarmSearchCommon.h>
@@ -55,6 +58,17 @@ private:
     QList<QVariantMap> m_alarms;
 };
 
+bool fetchAll(AlarmPager& pager, const QVariantMap& args, QVariantList* found, QString* error)
+{
+    return pager.fetchAll(
+        args,
+        [found](const QVariantList& page, QString*) {
+            *found += page;
+            return true;
+        },
+        error);
+}
+
 } // namespace
 
 class TestCliParts : public QObject
@@ -66,41 +80,61 @@ private slots:
     {
         QTest::addColumn<QString>("text");
         QTest::addColumn<bool>("isEnd");
+        QTest::addColumn<QString>("zone");
         QTest::addColumn<QString>("expected"); // empty: rejected
-        QTest::newRow("full") << "2026-11-01T08:15:30" << false << "2026-11-01T08:15:30";
-        QTest::newRow("full with Z") << "2026-11-01T08:15:30Z" << true << "2026-11-01T08:15:30";
-        QTest::newRow("date as start") << "2026-11-01" << false << "2026-11-01T00:00:00";
-        QTest::newRow("date as end") << "2026-11-01" << true << "2026-11-01T23:59:59";
-        QTest::newRow("hours ago") << "24h" << false << "2026-11-19T12:00:00";
-        QTest::newRow("days ago") << "7d" << false << "2026-11-13T12:00:00";
-        QTest::newRow("minutes ago") << "90m" << true << "2026-11-20T10:30:00";
-        QTest::newRow("now") << "now" << true << "2026-11-20T12:00:00";
-        QTest::newRow("unknown unit") << "3y" << false << "";
-        QTest::newRow("impossible date") << "2026-02-30" << false << "";
-        QTest::newRow("words") << "yesterday" << false << "";
+        const QString utc = QStringLiteral("UTC");
+        const QString berlin = QStringLiteral("Europe/Berlin");
+        QTest::newRow("full") << "2026-11-01T08:15:30" << false << utc << "2026-11-01T08:15:30";
+        QTest::newRow("Z") << "2026-11-01T08:15:30Z" << true << berlin << "2026-11-01T08:15:30";
+        QTest::newRow("offset") << "2026-11-01T08:15:30+02:00" << false << utc
+                                << "2026-11-01T06:15:30";
+        QTest::newRow("offset without colon")
+            << "2026-11-01T08:15-0130" << false << berlin << "2026-11-01T09:45:00";
+        QTest::newRow("fraction") << "2026-11-01T08:15:30.987Z" << true << utc
+                                  << "2026-11-01T08:15:30";
+        QTest::newRow("blank, minutes, start")
+            << "2026-11-01 08:15" << false << utc << "2026-11-01T08:15:00";
+        QTest::newRow("blank, minutes, end")
+            << "2026-11-01 08:15" << true << utc << "2026-11-01T08:15:59";
+        QTest::newRow("naive in zone")
+            << "2026-07-01 08:15:30" << false << berlin << "2026-07-01T06:15:30";
+        QTest::newRow("date as start") << "2026-11-01" << false << utc << "2026-11-01T00:00:00";
+        QTest::newRow("date as end") << "2026-11-01" << true << utc << "2026-11-01T23:59:59";
+        QTest::newRow("date in zone") << "2026-11-01" << false << berlin << "2026-10-31T23:00:00";
+        QTest::newRow("hours ago") << "24h" << false << berlin << "2026-11-19T12:00:00";
+        QTest::newRow("weeks ago") << "2w" << false << utc << "2026-11-06T12:00:00";
+        QTest::newRow("minutes ago") << "90m" << true << utc << "2026-11-20T10:30:00";
+        QTest::newRow("now") << "NOW" << true << utc << "2026-11-20T12:00:00";
+        QTest::newRow("unknown unit") << "3y" << false << utc << "";
+        QTest::newRow("impossible date") << "2026-02-30" << false << utc << "";
+        QTest::newRow("impossible hour") << "2026-11-01T25:00" << false << utc << "";
+        QTest::newRow("bad offset") << "2026-11-01T08:15+25:00" << false << utc << "";
+        QTest::newRow("words") << "yesterday" << false << utc << "";
     }
 
     void times()
     {
         QFETCH(QString, text);
         QFETCH(bool, isEnd);
+        QFETCH(QString, zone);
         QFETCH(QString, expected);
         QString time;
         QString error;
         const bool ok =
             TimeArgument::parse(text, isEnd ? TimeArgument::Bound::End : TimeArgument::Bound::Start,
-                                kNow, &time, &error);
+                                kNow, TimeArgument::zoneNamed(zone), &time, &error);
         QCOMPARE(ok, !expected.isEmpty());
         QCOMPARE(time, expected);
-        QCOMPARE(error.isEmpty(), ok);
+        if (!ok)
+            QVERIFY2(error.contains(TimeArgument::acceptedForms()), qPrintable(error));
     }
 
     void queryArguments()
     {
         QueryFilter filter;
         filter.events =
-            QStringList{QStringLiteral("CamEvent:Motion"), QStringLiteral("VCA:Loitering"),
-                        QStringLiteral("ExtIODevice:DI"), QStringLiteral("StationConn")};
+            QStringList{QStringLiteral("camevent:motion"), QStringLiteral("VCA:LOITERING"),
+                        QStringLiteral("ExtIODevice:DI"), QStringLiteral("stationconn")};
         filter.states = QStringList{QStringLiteral("handled"), QStringLiteral("false-alarm")};
         filter.names = QStringList{QStringLiteral("Main Gate")};
         filter.devices = QStringList{QStringLiteral("Lobby"), QStringLiteral("Dock")};
@@ -144,10 +178,17 @@ private slots:
         QTest::addColumn<QString>("error");
         QueryFilter filter;
         filter.events = QStringList{QStringLiteral("StationConn:Lost")};
-        QTest::newRow("sub-event of a class without") << filter << "has no sub-events";
-        filter = QueryFilter();
+        QTest::newRow("sub-event of a class without") << filter << "StationConn has no sub-events";
         filter.events = QStringList{QStringLiteral(":Motion")};
         QTest::newRow("no class") << filter << "expected CLASS or CLASS:SUBEVENT";
+        filter.events = QStringList{QStringLiteral("Bogus")};
+        QTest::newRow("unknown class") << filter
+                                       << "\"Bogus\" (expected CLASS or CLASS:SUBEVENT, "
+                                          "CLASS one of CamEvent, VCA, CamConn";
+        filter.events = QStringList{QStringLiteral("VCA:Motion")};
+        QTest::newRow("unknown sub-event") << filter
+                                           << "sub-event \"Motion\" of VCA (expected "
+                                              "one of LineDetection, FieldDetection";
         filter = QueryFilter();
         filter.eventGroups = QStringList{QStringLiteral("cameras")};
         QTest::newRow("unknown group") << filter << "unknown event group";
@@ -200,8 +241,9 @@ private slots:
         });
         QVariantList found;
         QString error;
-        QVERIFY(pager.fetchAll(QVariantMap{{ARG_START_TIME, QStringLiteral("2000-01-01T00:00:00")}},
-                               &found, &error));
+        QVERIFY(fetchAll(pager,
+                         QVariantMap{{ARG_START_TIME, QStringLiteral("2000-01-01T00:00:00")}},
+                         &found, &error));
         QCOMPARE(found.size(), alarmCount);
         QSet<QString> ids;
         QString previousTime = QStringLiteral("9999");
@@ -229,30 +271,230 @@ private slots:
         });
         QVariantList found;
         QString error;
-        QVERIFY(pager.fetchAll(QVariantMap(), &found, &error));
+        QVERIFY(fetchAll(pager, QVariantMap(), &found, &error));
         QCOMPARE(found.size(), AlarmPager::kMaxRecords);
         QVERIFY(pager.warning().contains(QStringLiteral("may be missing")));
     }
 
-    void csvQuotesAndRepeatsAlarmFields()
+    void csvQuotesGuardsAndRepeatsAlarmFields()
     {
-        const QVariantMap fields{{QStringLiteral("AlarmID"), QStringLiteral("A0000001")},
-                                 {QStringLiteral("AlarmName"), QStringLiteral("Gate, \"north\"")}};
+        const QVariantMap fields{
+            {QStringLiteral("AlarmID"), QStringLiteral("A0000001")},
+            {QStringLiteral("AlarmName"), QStringLiteral("Gate, \"north\"")},
+            {QStringLiteral("ServerTime"), QStringLiteral("2026-11-20T08:00:00Z")},
+            {QStringLiteral("Note"), QStringLiteral("=HYPERLINK(\"x\")")}};
         const QVariantList history{
             QVariantMap{{QStringLiteral("State"), QStringLiteral("Unhandled")}},
             QVariantMap{{QStringLiteral("State"), QStringLiteral("Handled")},
                         {QStringLiteral("Note"), QStringLiteral("two\nlines")}}};
-        const QString csv = QString::fromUtf8(ExportWriter::toCsv(
-            {ExportedAlarm{fields, history}, ExportedAlarm{fields, QVariantList()}}));
+        ExportWriter::Options options;
+        options.byteOrderMark = true;
+        options.zone = TimeArgument::zoneNamed(QStringLiteral("+01:00"));
+        ExportWriter writer(options);
+        const QByteArray bytes = writer.begin() + writer.alarm(ExportedAlarm{fields, history}) +
+                                 writer.alarm(ExportedAlarm{fields, QVariantList()}) + writer.end();
+        QVERIFY(bytes.startsWith("\xEF\xBB\xBF"
+                                 "AlarmID,"));
+        const QString csv = QString::fromUtf8(bytes.mid(3));
         const QStringList rows = csv.split(QStringLiteral("\r\n"), Qt::SkipEmptyParts);
         QCOMPARE(rows.size(), 4);
-        QVERIFY(rows[0].startsWith(QStringLiteral("AlarmID,EventClass,")));
-        QVERIFY(rows[0].endsWith(QStringLiteral(",ChangeTime,ChangeState,ChangeNote,ChangeUser")));
-        QCOMPARE(rows[1], QStringLiteral("A0000001,,,,\"Gate, \"\"north\"\"\",,,,,,,,Unhandled,,"));
-        QCOMPARE(
-            rows[2],
-            QStringLiteral("A0000001,,,,\"Gate, \"\"north\"\"\",,,,,,,,Handled,\"two\nlines\","));
-        QCOMPARE(rows[3], QStringLiteral("A0000001,,,,\"Gate, \"\"north\"\"\",,,,,,,,,,"));
+        QCOMPARE(rows[0], ExportWriter::csvColumns().join(u','));
+        const QString alarm = QStringLiteral("A0000001,,,,\"Gate, \"\"north\"\"\",,,"
+                                             "2026-11-20T09:00:00+01:00,"
+                                             "\"'=HYPERLINK(\"\"x\"\")\",,,");
+        QCOMPARE(rows[1], alarm + QStringLiteral(",Unhandled,,"));
+        QCOMPARE(rows[2], alarm + QStringLiteral(",Handled,\"two\nlines\","));
+        QCOMPARE(rows[3], alarm + QStringLiteral(",,,"));
+    }
+
+    void csvFormulaGuard_data()
+    {
+        QTest::addColumn<QString>("value");
+        QTest::addColumn<QString>("guarded");
+        QTest::addColumn<QString>("raw");
+        QTest::newRow("equals") << "=1+2"
+                                << "'=1+2"
+                                << "=1+2";
+        QTest::newRow("plus") << "+1"
+                              << "'+1"
+                              << "+1";
+        QTest::newRow("minus") << "-1"
+                               << "'-1"
+                               << "-1";
+        QTest::newRow("at") << "@SUM(A1)"
+                            << "'@SUM(A1)"
+                            << "@SUM(A1)";
+        QTest::newRow("tab") << "\tx"
+                             << "'\tx"
+                             << "\tx";
+        QTest::newRow("carriage return") << "\rx"
+                                         << "\"'\rx\""
+                                         << "\"\rx\"";
+        QTest::newRow("inside") << "a=b"
+                                << "a=b"
+                                << "a=b";
+        QTest::newRow("empty") << ""
+                               << ""
+                               << "";
+    }
+
+    void csvFormulaGuard()
+    {
+        QFETCH(QString, value);
+        QFETCH(QString, guarded);
+        QFETCH(QString, raw);
+        QCOMPARE(ExportWriter::csvField(value, false), guarded);
+        QCOMPARE(ExportWriter::csvField(value, true), raw);
+    }
+
+    void searchWriterStreamsOneAnswer_data()
+    {
+        QTest::addColumn<bool>("pretty");
+        QTest::addColumn<int>("pages");
+        QTest::newRow("compact") << false << 2;
+        QTest::newRow("pretty") << true << 2;
+        QTest::newRow("compact, nothing found") << false << 0;
+        QTest::newRow("pretty, nothing found") << true << 0;
+    }
+
+    void searchWriterStreamsOneAnswer()
+    {
+        QFETCH(bool, pretty);
+        QFETCH(int, pages);
+        SearchWriter::Options options;
+        options.method = METHOD_QUERY_UNHANDLED_ALARM;
+        options.pretty = pretty;
+        SearchWriter writer(options);
+        QByteArray out;
+        for (int i = 0; i < pages; ++i)
+            out += writer.page({alarm(2 * i + 1, kNow), alarm(2 * i + 2, kNow)});
+        out += writer.finish(true);
+        QJsonParseError error;
+        const QJsonObject answer = QJsonDocument::fromJson(out, &error).object();
+        QCOMPARE(error.error, QJsonParseError::NoError);
+        QCOMPARE(answer.value(QLatin1String("method")).toString(), METHOD_QUERY_UNHANDLED_ALARM);
+        QCOMPARE(answer.value(QLatin1String("truncated")).toBool(), true);
+        const QJsonArray alarms =
+            answer.value(QLatin1String("result")).toObject().value(ARG_QUERY_RESULT).toArray();
+        QCOMPARE(alarms.size(), 2 * pages);
+        if (pages > 0)
+            QCOMPARE(alarms.last().toObject().value(QLatin1String("AlarmID")).toString(),
+                     QStringLiteral("A0000004"));
+    }
+
+    void tableFitsWidthByDisplayWidth()
+    {
+        QVariantMap wide = alarm(1, kNow);
+        wide.insert(QStringLiteral("AlarmName"),
+                    QStringLiteral("正門の動き検知 🚨 at the main gate"));
+        wide.insert(QStringLiteral("Note"), QStringLiteral("Cafe\u0301 checked, all fine"));
+        QVariantMap plain = alarm(2, kNow.addSecs(-60));
+        plain.insert(QStringLiteral("AlarmName"), QStringLiteral("Motion"));
+        for (QVariantMap* fields : {&wide, &plain})
+            fields->insert(QStringLiteral("Muted"), QStringLiteral("false"));
+        QCOMPARE(AlarmTable::displayWidth(QStringLiteral("正門🚨e\u0301")), 7);
+        AlarmTable table(TimeArgument::zoneNamed(QStringLiteral("+01:00")), 72);
+        const QStringList lines =
+            table.page({wide, plain}).split(QLatin1Char('\n'), Qt::SkipEmptyParts);
+        QCOMPARE(lines.size(), 3);
+        QVERIFY2(lines[0].startsWith(QStringLiteral("ALARM     TIME (UTC+01)        ")),
+                 qPrintable(lines[0]));
+        QVERIFY2(lines[2].startsWith(QStringLiteral("A0000002  2026-11-20 12:59:00  ")),
+                 qPrintable(lines[2]));
+        QVERIFY(lines[1].contains(QStringLiteral("…")));
+        // MUTED starts at the same display column in every line, wide characters or not.
+        const auto mutedColumn = [](const QString& line, const char* text) {
+            return AlarmTable::displayWidth(line.left(line.indexOf(QLatin1String(text))));
+        };
+        for (const QString& line : lines)
+            QVERIFY2(AlarmTable::displayWidth(line) <= 72, qPrintable(line));
+        QCOMPARE(mutedColumn(lines[1], "false"), mutedColumn(lines[0], "MUTED"));
+        QCOMPARE(mutedColumn(lines[2], "false"), mutedColumn(lines[0], "MUTED"));
+    }
+
+    void batchRequests_data()
+    {
+        QTest::addColumn<QByteArray>("line");
+        QTest::addColumn<QVariantMap>("args"); // expected; empty with an error
+        QTest::addColumn<QString>("error");
+        const auto row = [](const char* name, const char* line, const QVariantMap& args,
+                            const char* error = "") {
+            QTest::newRow(name) << QByteArray(line) << args << QString::fromUtf8(error);
+        };
+        row("friendly search",
+            R"({"method":"QryAlarmList","args":{"stateFilter":["unhandled","false-alarm"],)"
+            R"("triggerEventFilter":["camevent:motion","system"],"startTime":"2026-11-01 08:00",)"
+            R"("endTime":"24h","all":true}})",
+            {{ARG_STATE_FILTER, QStringLiteral("<AlarmStateList><State>Unhandled</State>"
+                                               "<State>FalseAlarm</State></AlarmStateList>")},
+             {ARG_TRIGGER_EVENT_FILTER, QStringLiteral("<Event CameraEvent=\"Motion\">CamEvent"
+                                                       "</Event>") +
+                                            SYSTEM_TRIGGER_EVENT_FILTER_STRING},
+             {ARG_START_TIME, QStringLiteral("2026-11-01T08:00:00")},
+             {ARG_END_TIME, QStringLiteral("2026-11-19T12:00:00")}});
+        row("raw fragments",
+            R"({"method":"QryUnhandledAlarm","args":{"stateFilter":"<AlarmStateList/>",)"
+            R"("rules":[{"type":1,"tagList":["Dock"]}]}})",
+            {{ARG_STATE_FILTER, QStringLiteral("<AlarmStateList/>")},
+             {ARG_RULES, QVariantList{QVariantMap{
+                             {QStringLiteral("type"), 1},
+                             {QStringLiteral("tagList"), QStringList{QStringLiteral("Dock")}}}}}});
+        row("update",
+            R"({"method":"UpdateAlarm","args":{"alarmIdList":"A1","alarmStatus":"handled"}})",
+            {{ARG_ALARM_ID_LIST, QStringList{QStringLiteral("A1")}},
+             {ARG_ALARM_STATUS, QStringLiteral("Handled")}});
+        row("mute",
+            R"({"method":"MuteAlarm","args":{"alarmIdList":["A1"],"isMute":true,"muteTimeSecond":60}})",
+            {{ARG_ALARM_ID_LIST, QStringList{QStringLiteral("A1")}},
+             {ARG_IS_MUTE, true},
+             {ARG_MUTE_TIME_SECOND, 60}});
+        row("unknown key", R"({"method":"QryAlarmList","args":{"from":"7d","bogus":1}})", {},
+            "args.bogus: unknown key for QryAlarmList (expected triggerEventFilter, stateFilter, "
+            "startTime, endTime, rules, relayPath, all)");
+        row("unknown top key", R"({"method":"QryAlarmList","argz":{}})", {},
+            "unknown key \"argz\"");
+        row("all on a history",
+            R"({"method":"GetAlarmHistory","args":{"alarmId":"A1","all":true}})", {},
+            "args.all: unknown key for GetAlarmHistory");
+        row("unknown state", R"({"method":"QryAlarmList","args":{"stateFilter":"Closed"}})", {},
+            "args.stateFilter: unknown state \"Closed\"");
+        row("unknown event", R"({"method":"QryAlarmList","args":{"triggerEventFilter":["Bogus"]}})",
+            {}, "args.triggerEventFilter: unknown event class \"Bogus\"");
+        row("bad time", R"({"method":"QryAlarmList","args":{"startTime":"soon"}})", {},
+            "args.startTime: bad time \"soon\"");
+        row("time as number", R"({"method":"QryAlarmList","args":{"endTime":5}})", {},
+            "args.endTime: expected a time text");
+        row("mute flag as text",
+            R"({"method":"MuteAlarm","args":{"alarmIdList":["A1"],"isMute":"yes"}})", {},
+            "args.isMute: expected true or false");
+        row("fractional seconds",
+            R"({"method":"MuteAlarm","args":{"alarmIdList":["A1"],"isMute":true,"muteTimeSecond":1.5}})",
+            {}, "args.muteTimeSecond: expected a whole number");
+        row("ids as number",
+            R"({"method":"UpdateAlarm","args":{"alarmIdList":[1],"alarmStatus":"Handled"}})", {},
+            "args.alarmIdList: expected a text or a list of texts");
+        row("missing state", R"({"method":"UpdateAlarm","args":{"alarmIdList":["A1"]}})", {},
+            "args.alarmStatus: required for UpdateAlarm");
+        row("bad rule", R"({"method":"QryAlarmList","args":{"rules":[{"type":2,"tagList":[]}]}})",
+            {}, "args.rules: expected a list of");
+    }
+
+    void batchRequests()
+    {
+        QFETCH(QByteArray, line);
+        QFETCH(QVariantMap, args);
+        QFETCH(QString, error);
+        BatchRequest request;
+        QString message;
+        const bool ok = BatchRequest::read(QJsonDocument::fromJson(line).object(), kNow,
+                                           QTimeZone::utc(), &request, &message);
+        QVERIFY2(ok == error.isEmpty(), qPrintable(message));
+        if (ok) {
+            QCOMPARE(request.args, args);
+            QCOMPARE(request.all, line.contains("\"all\":true"));
+        } else {
+            QVERIFY2(message.startsWith(error), qPrintable(message));
+        }
     }
 };
 

@@ -313,6 +313,10 @@ private slots:
         QCOMPARE(
             call(METHOD_GET_ALARM_HISTORY, {{ARG_ALARM_ID, QStringLiteral("A0000001")}}).resultCode,
             QStringLiteral("-1"));
+        QVERIFY2(m_host->tunnelClient().connectionError().startsWith(
+                     QStringLiteral("connection to 127.0.0.1:")),
+                 qPrintable(m_host->tunnelClient().connectionError()));
+        QVERIFY(m_host->tunnelClient().connectionError().endsWith(QLatin1String(" lost")));
     }
 
     void recordLimitAndPagination()
@@ -328,7 +332,13 @@ private slots:
         });
         QVariantList all;
         QString error;
-        QVERIFY(pager.fetchAll(QVariantMap(), &all, &error));
+        QVERIFY(pager.fetchAll(
+            QVariantMap(),
+            [&all](const QVariantList& page, QString*) {
+                all += page;
+                return true;
+            },
+            &error));
         QCOMPARE(pager.pages(), 3);
         QCOMPARE(all.size(), seedCount);
         QCOMPARE(all.mid(0, capped.size()), capped); // the newest first, as one search gives them
@@ -378,6 +388,34 @@ private slots:
         QTest::newRow("update without state")
             << memory + QStringList{QStringLiteral("update"), QStringLiteral("A0000001")}
             << QByteArray() << 2 << "--state is required";
+        // The plug-in's trace line about the failed request stays off standard error.
+        QTest::newRow("history of an unknown alarm")
+            << memory + QStringList{QStringLiteral("history"), QStringLiteral("NOPE")}
+            << QByteArray() << 1 << "unknown alarm: NOPE";
+        QTest::newRow("mute with an unknown alarm")
+            << memory + QStringList{QStringLiteral("mute"), QStringLiteral("NOPE"),
+                                    QStringLiteral("A0000002"), QStringLiteral("X1")}
+            << QByteArray() << 1 << "unknown alarms: NOPE, X1; nothing muted";
+        QTest::newRow("update of an unknown alarm")
+            << memory + QStringList{QStringLiteral("update"), QStringLiteral("A0000001"),
+                                    QStringLiteral("NOPE"), QStringLiteral("--state"),
+                                    QStringLiteral("handled")}
+            << QByteArray() << 1 << "unknown alarm: NOPE";
+        QTest::newRow("unknown batch key")
+            << memory + QStringList{QStringLiteral("batch")}
+            << QByteArray("{\"method\":\"QryAlarmList\",\"args\":{\"bogus\":1}}\n") << 2
+            << "line 1: args.bogus: unknown key for QryAlarmList";
+        QTest::newRow("unknown event class")
+            << QStringList{QStringLiteral("query"), QStringLiteral("--event"),
+                           QStringLiteral("Bogus")}
+            << QByteArray() << 2 << "unknown event class \"Bogus\"";
+        QTest::newRow("unknown zone")
+            << QStringList{QStringLiteral("query"), QStringLiteral("--tz"),
+                           QStringLiteral("Mars/Base")}
+            << QByteArray() << 2 << "unknown time zone \"Mars/Base\"";
+        QTest::newRow("demo with a database")
+            << QStringList{QStringLiteral("demo"), QStringLiteral("--db"), QStringLiteral("x.db")}
+            << QByteArray() << 2 << "demo runs its own in-memory server";
     }
 
     void cliErrorsAreOneLine()
@@ -400,6 +438,108 @@ private slots:
         QCOMPARE(error.count(QLatin1Char('\n')), 1);
         QVERIFY2(error.startsWith(QStringLiteral("alarmsearch: ")), qPrintable(error));
         QVERIFY2(error.contains(message), qPrintable(error));
+    }
+
+    void simulatorNamesBadOptions_data()
+    {
+        QTest::addColumn<QStringList>("arguments");
+        QTest::addColumn<int>("exitCode");
+        QTest::addColumn<QString>("output"); // the start of stderr, or of stdout on success
+        QTest::newRow("version") << QStringList{QStringLiteral("--version")} << 0
+                                 << "alarmsearch-sim 1.0.0\n";
+        QTest::newRow("unknown option") << QStringList{QStringLiteral("--bogus")} << 2
+                                        << "alarmsearch-sim: Unknown option 'bogus'.; see";
+        QTest::newRow("bad port") << QStringList{QStringLiteral("--port"), QStringLiteral("99999")}
+                                  << 2 << "alarmsearch-sim: --port needs a number from 0 to 65535";
+        QTest::newRow("stray argument") << QStringList{QStringLiteral("now")} << 2
+                                        << "alarmsearch-sim: unexpected argument \"now\"";
+    }
+
+    void simulatorNamesBadOptions()
+    {
+        QFETCH(QStringList, arguments);
+        QFETCH(int, exitCode);
+        QFETCH(QString, output);
+        QProcess simulator;
+        simulator.start(QStringLiteral(ALARMSEARCH_SIM_EXE), arguments);
+        QVERIFY(simulator.waitForFinished(10000));
+        QCOMPARE(simulator.exitCode(), exitCode);
+        const QString text = QString::fromUtf8(exitCode == 0 ? simulator.readAllStandardOutput()
+                                                             : simulator.readAllStandardError());
+        QVERIFY2(text.startsWith(output), qPrintable(text));
+        QCOMPARE(text.count(QLatin1Char('\n')), 1);
+    }
+
+    // The command-line client end to end on one database of more alarms than a search returns.
+    void cliCommandsKeepTheirWord()
+    {
+        QTemporaryDir dir;
+        const QString db = dir.filePath(QStringLiteral("alarms.sqlite"));
+        const auto run = [&](const QStringList& arguments, QByteArray* err = nullptr) {
+            QProcess cli;
+            cli.start(QStringLiteral(ALARMSEARCH_CLI_EXE),
+                      QStringList{QStringLiteral("--plugin"),
+                                  QStringLiteral(ALARMSEARCH_PLUGIN_FILE), QStringLiteral("--db"),
+                                  db, QStringLiteral("--seed-count"), QStringLiteral("5100")} +
+                          arguments);
+            cli.closeWriteChannel();
+            // Generous: sanitizer builds on a busy machine are many times slower.
+            if (!cli.waitForFinished(600000) || cli.exitCode() != 0)
+                qFatal("%s failed (exit code %d): %s", qPrintable(arguments.join(u' ')),
+                       cli.exitCode(), cli.readAllStandardError().constData());
+            if (err)
+                *err = cli.readAllStandardError();
+            return cli.readAllStandardOutput();
+        };
+        QByteArray err;
+        QCOMPARE(run({QStringLiteral("--version")}), QByteArray("alarmsearch 1.0.0\n"));
+        // Help anywhere runs nothing; the first real use seeds the database and says so.
+        QVERIFY(
+            run({QStringLiteral("update"), QStringLiteral("A0000001"), QStringLiteral("--state"),
+                 QStringLiteral("FalseAlarm"), QStringLiteral("--help-all")})
+                .startsWith("Usage: alarmsearch update"));
+        QVERIFY(run({QStringLiteral("--help-all")}).startsWith("Usage: alarmsearch"));
+        QVERIFY(!QFile::exists(db));
+        const QJsonObject capped =
+            QJsonDocument::fromJson(
+                run({QStringLiteral("query"), QStringLiteral("--format"), QStringLiteral("json")},
+                    &err))
+                .object();
+        QVERIFY2(err.startsWith("created the database " + db.toUtf8()), err.constData());
+        QCOMPARE(capped.value(QLatin1String("truncated")).toBool(), true);
+        QCOMPARE(capped.value(QLatin1String("result"))
+                     .toObject()
+                     .value(ARG_QUERY_RESULT)
+                     .toArray()
+                     .size(),
+                 AlarmPager::kMaxRecords);
+
+        const QList<QByteArray> lines = run({QStringLiteral("query"), QStringLiteral("--all"),
+                                             QStringLiteral("--format"), QStringLiteral("jsonl")})
+                                            .split('\n');
+        QCOMPARE(lines.size(), 5100 + 1);
+        QCOMPARE(
+            QJsonDocument::fromJson(lines[0]).object().value(QLatin1String("AlarmID")).toString(),
+            QStringLiteral("A0005100"));
+
+        // The export walks the whole range by default and appears only when complete.
+        const QString csv = dir.filePath(QStringLiteral("all.csv"));
+        run({QStringLiteral("export"), QStringLiteral("--bom"), QStringLiteral("-o"), csv}, &err);
+        QCOMPARE(err, QByteArray("exported 5100 alarm(s)\n"));
+        QFile file(csv);
+        QVERIFY(file.open(QIODevice::ReadOnly));
+        const QByteArray bytes = file.readAll();
+        QVERIFY(bytes.startsWith("\xEF\xBB\xBF"
+                                 "AlarmID,"));
+        QSet<QByteArray> ids;
+        for (const QByteArray& row : bytes.split('\n'))
+            ids.insert(row.left(8));
+        QVERIFY(ids.contains("A0000001") && ids.contains("A0005100"));
+        // No temporary file is left beside it.
+        QCOMPARE(QDir(dir.path()).entryList(QDir::Files),
+                 QStringList({QStringLiteral("alarms.sqlite"), QStringLiteral("all.csv")}));
+
+        QVERIFY(run({QStringLiteral("classes")}).contains("camera    CamEvent: DI, DO, Motion,"));
     }
 
     void cliBatchAnswersEachLine()

@@ -9,6 +9,7 @@
 #include <QDir>
 #include <QFileInfo>
 #include <QReadWriteLock>
+#include <QScopeGuard>
 #include <QSqlError>
 #include <QSqlQuery>
 #include <QStandardPaths>
@@ -21,6 +22,7 @@ const QString kStatusOk = QStringLiteral("0");
 const QString kStatusBadCommand = QStringLiteral("80000001");
 const QString kStatusUnknownMethod = QStringLiteral("80000002");
 const QString kStatusServerError = QStringLiteral("80000003");
+const QString kStatusUnknownAlarm = QStringLiteral("80000004");
 
 const QString kResultOk = QStringLiteral("0");
 const QString kResultUnknownAlarm = QStringLiteral("1");
@@ -274,36 +276,48 @@ CommandReply AlarmServer::Private::processAlarm(QSqlDatabase db, const XmlElemen
     return ok(reply);
 }
 
-CommandReply AlarmServer::Private::getAlarmInfo(QSqlDatabase db, const XmlElement& command)
+CommandReply AlarmServer::Private::getAlarmInfo(QSqlDatabase, const XmlElement& command)
 {
-    const CommandReply unknownAlarm = ok(QStringLiteral("<GetAlarmInfoRes/>"));
+    const CommandReply unknownAlarm{kStatusUnknownAlarm, QString()};
     const std::optional<qint64> number = parseAlarmId(command.childText(u"AlarmID"));
     if (!number)
         return unknownAlarm;
 
+    // An export asks for every alarm's history: the two statements are prepared once per thread.
+    QString error;
+    QSqlQuery* alarm = connections.preparedQuery(
+        QStringLiteral("SELECT %1 FROM alarm WHERE id = ?").arg(kAlarmColumns), &error);
+    QSqlQuery* log = connections.preparedQuery(QStringLiteral("SELECT time, state, note, user "
+                                                              "FROM change_log WHERE alarm_id = ? "
+                                                              "ORDER BY time, id"),
+                                               &error);
+    if (!alarm || !log) {
+        qWarning("alarm server: cannot prepare a statement: %s", qPrintable(error));
+        return {kStatusServerError, QString()};
+    }
+    // Reset both when done, which ends their reads.
+    const auto finish = qScopeGuard([&] {
+        alarm->finish();
+        log->finish();
+    });
+
     QReadLocker locker(&lock);
-    QSqlQuery alarm(db);
-    alarm.prepare(QStringLiteral("SELECT %1 FROM alarm WHERE id = ?").arg(kAlarmColumns));
-    if (!execWith(alarm, {*number}))
-        return serverError(alarm);
-    if (!alarm.next())
+    if (!execWith(*alarm, {*number}))
+        return serverError(*alarm);
+    if (!alarm->next())
         return unknownAlarm;
     QString reply = QStringLiteral("<GetAlarmInfoRes><Alarm>");
-    appendAlarmFields(reply, alarm, QDateTime::currentSecsSinceEpoch());
+    appendAlarmFields(reply, *alarm, QDateTime::currentSecsSinceEpoch());
 
-    QSqlQuery log(db);
-    log.setForwardOnly(true);
-    log.prepare(QStringLiteral("SELECT time, state, note, user FROM change_log "
-                               "WHERE alarm_id = ? ORDER BY time, id"));
-    if (!execWith(log, {*number}))
-        return serverError(log);
+    if (!execWith(*log, {*number}))
+        return serverError(*log);
     reply += QLatin1String("<ChangeLogs>");
-    while (log.next()) {
+    while (log->next()) {
         reply += QLatin1String("<Entry>");
-        appendTextElement(reply, QLatin1String("Time"), formatTime(log.value(0).toLongLong()));
-        appendTextElement(reply, QLatin1String("State"), log.value(1).toString());
-        appendTextElement(reply, QLatin1String("Note"), log.value(2).toString());
-        appendTextElement(reply, QLatin1String("User"), log.value(3).toString());
+        appendTextElement(reply, QLatin1String("Time"), formatTime(log->value(0).toLongLong()));
+        appendTextElement(reply, QLatin1String("State"), log->value(1).toString());
+        appendTextElement(reply, QLatin1String("Note"), log->value(2).toString());
+        appendTextElement(reply, QLatin1String("User"), log->value(3).toString());
         reply += QLatin1String("</Entry>");
     }
     reply += QLatin1String("</ChangeLogs></Alarm></GetAlarmInfoRes>");

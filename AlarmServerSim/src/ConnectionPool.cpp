@@ -23,11 +23,13 @@ ConnectionPool::ConnectionPool()
 ConnectionPool::~ConnectionPool()
 {
     QMutexLocker locker(&m_mutex);
-    const QStringList names = m_threadConnections.values();
+    const QList<std::shared_ptr<ThreadConnection>> connections = m_threadConnections.values();
     m_threadConnections.clear();
     locker.unlock();
-    for (const QString& name : names)
-        QSqlDatabase::removeDatabase(name);
+    for (const std::shared_ptr<ThreadConnection>& connection : connections) {
+        connection->statements.clear();
+        QSqlDatabase::removeDatabase(connection->name);
+    }
     // The primary connection goes last: it keeps an in-memory database alive.
     if (!m_primaryName.isEmpty())
         QSqlDatabase::removeDatabase(m_primaryName);
@@ -62,18 +64,44 @@ QSqlDatabase ConnectionPool::forCurrentThread(QString* errorMessage)
         QMutexLocker locker(&m_mutex);
         const auto it = m_threadConnections.constFind(thread);
         if (it != m_threadConnections.constEnd())
-            return QSqlDatabase::database(*it, false);
+            return QSqlDatabase::database((*it)->name, false);
     }
     QSqlDatabase db = addConnection(errorMessage);
     if (!db.isValid())
         return db;
     QMutexLocker locker(&m_mutex);
-    m_threadConnections.insert(thread, db.connectionName());
+    m_threadConnections.insert(
+        thread, std::make_shared<ThreadConnection>(ThreadConnection{db.connectionName(), {}}));
     // Runs on the finishing thread itself, which owns the connection.
     QObject::connect(
         thread, &QThread::finished, &m_context, [this, thread] { dropThreadConnection(thread); },
         Qt::DirectConnection);
     return db;
+}
+
+QSqlQuery* ConnectionPool::preparedQuery(const QString& sql, QString* errorMessage)
+{
+    const QSqlDatabase db = forCurrentThread(errorMessage);
+    std::shared_ptr<ThreadConnection> connection;
+    {
+        QMutexLocker locker(&m_mutex);
+        connection = m_threadConnections.value(QThread::currentThread());
+    }
+    if (!db.isValid() || !connection)
+        return nullptr;
+    std::unique_ptr<QSqlQuery>& query = connection->statements[sql];
+    if (!query) {
+        auto prepared = std::make_unique<QSqlQuery>(db);
+        prepared->setForwardOnly(true);
+        if (!prepared->prepare(sql)) {
+            if (errorMessage)
+                *errorMessage = prepared->lastError().text();
+            connection->statements.erase(sql);
+            return nullptr;
+        }
+        query = std::move(prepared);
+    }
+    return query.get();
 }
 
 QSqlDatabase ConnectionPool::addConnection(QString* errorMessage)
@@ -108,10 +136,12 @@ QSqlDatabase ConnectionPool::addConnection(QString* errorMessage)
 void ConnectionPool::dropThreadConnection(QThread* thread)
 {
     QMutexLocker locker(&m_mutex);
-    const QString name = m_threadConnections.take(thread);
+    const std::shared_ptr<ThreadConnection> connection = m_threadConnections.take(thread);
     locker.unlock();
-    if (!name.isEmpty())
-        QSqlDatabase::removeDatabase(name);
+    if (connection) {
+        connection->statements.clear();
+        QSqlDatabase::removeDatabase(connection->name);
+    }
 }
 
 } // namespace AlarmServerSim

@@ -4,7 +4,11 @@
 #include <QMutex>
 #include <QObject>
 #include <QSqlDatabase>
+#include <QSqlQuery>
 #include <QString>
+
+#include <memory>
+#include <unordered_map>
 
 class QThread;
 
@@ -27,8 +31,19 @@ public:
     QSqlDatabase primary() const;
     // The calling thread's connection, opened on first use; invalid when it cannot be opened.
     QSqlDatabase forCurrentThread(QString* errorMessage);
+    // A statement of the calling thread's connection, prepared on its first use and kept until
+    // the thread ends, so that frequent commands do not compile their SQL each time. Call
+    // finish() on it after use, which ends its read. Null when it cannot be prepared.
+    QSqlQuery* preparedQuery(const QString& sql, QString* errorMessage);
 
 private:
+    struct ThreadConnection
+    {
+        QString name;
+        // Used by the owning thread only.
+        std::unordered_map<QString, std::unique_ptr<QSqlQuery>> statements;
+    };
+
     QSqlDatabase addConnection(QString* errorMessage);
     void dropThreadConnection(QThread* thread);
 
@@ -38,7 +53,7 @@ private:
     QString m_namePrefix;
     QString m_primaryName;
     QMutex m_mutex; // guards m_threadConnections and m_nextConnection
-    QHash<QThread*, QString> m_threadConnections;
+    QHash<QThread*, std::shared_ptr<ThreadConnection>> m_threadConnections;
     int m_nextConnection = 0;
     QObject m_context; // receiver of the threads' finished signals; disconnects them when gone
 };

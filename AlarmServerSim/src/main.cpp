@@ -39,17 +39,27 @@ bool quitOnSignals(QCoreApplication& app)
            ::sigaction(SIGTERM, &action, nullptr) == 0;
 }
 
+// A usage error: one line naming what is wrong, exit code 2.
+int usageError(const QString& message)
+{
+    std::fprintf(stderr, "alarmsearch-sim: %s; see 'alarmsearch-sim --help'\n",
+                 qPrintable(message));
+    return 2;
+}
+
 } // namespace
 
 int main(int argc, char* argv[])
 {
     QCoreApplication app(argc, argv);
     QCoreApplication::setApplicationName(QStringLiteral("alarmsearch-sim"));
+    QCoreApplication::setApplicationVersion(QStringLiteral(ALARMSEARCH_VERSION));
 
     QCommandLineParser parser;
     parser.setApplicationDescription(
         QStringLiteral("Simulated management server answering alarm commands over loopback TCP."));
-    parser.addHelpOption();
+    const QCommandLineOption helpOption = parser.addHelpOption();
+    const QCommandLineOption versionOption = parser.addVersionOption();
     const QCommandLineOption dbOption(QStringLiteral("db"),
                                       QStringLiteral("Database file (default: %1).")
                                           .arg(AlarmServerSim::AlarmServer::defaultDatabasePath()),
@@ -64,18 +74,33 @@ int main(int argc, char* argv[])
         QStringLiteral("Demo alarms seeded into a new database (default: 30000)."),
         QStringLiteral("count"), QStringLiteral("30000"));
     parser.addOptions({dbOption, memoryOption, portOption, seedCountOption});
-    parser.process(app);
+    if (!parser.parse(app.arguments()))
+        return usageError(parser.errorText());
+    if (parser.isSet(helpOption) || parser.isSet(QStringLiteral("help-all"))) {
+        std::printf("%s", qPrintable(parser.helpText()));
+        return 0;
+    }
+    if (parser.isSet(versionOption)) {
+        std::printf("alarmsearch-sim %s\n", qPrintable(app.applicationVersion()));
+        return 0;
+    }
+    if (!parser.positionalArguments().isEmpty())
+        return usageError(QStringLiteral("unexpected argument \"%1\"; it takes options only")
+                              .arg(parser.positionalArguments().constFirst()));
 
     bool portOk = false;
     const uint port = parser.value(portOption).toUInt(&portOk);
+    if (!portOk || port > 65535)
+        return usageError(QStringLiteral("--port needs a number from 0 to 65535, not \"%1\"")
+                              .arg(parser.value(portOption)));
     bool countOk = false;
     AlarmServerSim::AlarmServer::Options options;
     options.seedCount = parser.value(seedCountOption).toInt(&countOk);
-    if (!portOk || port > 65535 || !countOk || options.seedCount < 0 ||
-        (parser.isSet(dbOption) && parser.isSet(memoryOption))) {
-        std::fprintf(stderr, "%s\n", qPrintable(parser.helpText()));
-        return 2;
-    }
+    if (!countOk || options.seedCount < 0)
+        return usageError(QStringLiteral("--seed-count needs a number of alarms, not \"%1\"")
+                              .arg(parser.value(seedCountOption)));
+    if (parser.isSet(dbOption) && parser.isSet(memoryOption))
+        return usageError(QStringLiteral("--db and --memory exclude each other"));
     options.databasePath = parser.isSet(memoryOption) ? QStringLiteral(":memory:")
                            : parser.isSet(dbOption)
                                ? parser.value(dbOption)

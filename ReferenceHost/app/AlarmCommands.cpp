@@ -18,11 +18,32 @@ const QCommandLineOption kIdOption(QStringLiteral("id"),
                                    QStringLiteral("Alarm identifier; repeatable."),
                                    QStringLiteral("alarm-id"));
 
-bool answeredOk(const QList<PluginAnswer>& answers)
+// The server's per-alarm result code for an alarm it does not know.
+const QString kUnknownAlarmResult = QStringLiteral("1");
+
+QString unknownAlarmsMessage(const QStringList& ids)
 {
-    for (const PluginAnswer& answer : answers) {
-        if (answer.resultCode != QLatin1String("0"))
+    return QStringLiteral("unknown alarm%1: %2")
+        .arg(ids.size() == 1 ? QString() : QStringLiteral("s"), ids.join(QLatin1String(", ")));
+}
+
+// Asks the server for each alarm's history: the alarms it has none for are unknown. False on a
+// failure other than an unknown alarm (a lost connection, no answer in time).
+bool findUnknownAlarms(Cli& cli, const QStringList& ids, QStringList* unknown, int* exitCode)
+{
+    for (const QString& id : ids) {
+        QList<PluginAnswer> answers;
+        if (!cli.call(METHOD_GET_ALARM_HISTORY, QVariantMap{{ARG_ALARM_ID, id}}, &answers,
+                      exitCode))
             return false;
+        if (answers.constLast().resultCode == QLatin1String("0"))
+            continue;
+        const QString lost = cli.host().tunnelClient().connectionError();
+        if (!lost.isEmpty()) {
+            *exitCode = cli.fail(lost);
+            return false;
+        }
+        unknown->append(id);
     }
     return true;
 }
@@ -56,6 +77,15 @@ int sendMute(Cli& cli, const QStringList& arguments, bool isMute)
     }
     if (!cli.openHost(&exitCode))
         return exitCode;
+    // The server passes over unknown alarms without a word; check them first, and change nothing
+    // unless all are known.
+    QStringList unknown;
+    if (!findUnknownAlarms(cli, ids, &unknown, &exitCode))
+        return exitCode;
+    if (!unknown.isEmpty())
+        return cli.fail(
+            unknownAlarmsMessage(unknown) +
+            (isMute ? QStringLiteral("; nothing muted") : QStringLiteral("; nothing unmuted")));
     cli.session().send(METHOD_MUTE_ALARM, QVariantMap{{ARG_ALARM_ID_LIST, ids},
                                                       {ARG_IS_MUTE, isMute},
                                                       {ARG_MUTE_TIME_SECOND, seconds}});
@@ -128,13 +158,30 @@ int update(Cli& cli, const QStringList& arguments)
         return exitCode;
     for (const PluginAnswer& answer : std::as_const(answers))
         cli.printAnswer(METHOD_UPDATE_ALARM, answer);
+    if (answers.constLast().resultCode != QLatin1String("0"))
+        return cli.fail(cli.answerError(METHOD_UPDATE_ALARM, answers.constLast()));
 
     QMutexLocker locker(&mutex);
-    bool allUpdated = answeredOk(answers);
-    for (const QVariant& outcome : std::as_const(outcomes))
-        allUpdated =
-            allUpdated && outcome.toMap().value(ARG_UPDATE_RESULT).toString() == QLatin1String("0");
-    return allUpdated ? Cli::ExitOk : Cli::ExitFailed;
+    QStringList unknown;
+    QStringList failed;
+    for (const QVariant& outcome : std::as_const(outcomes)) {
+        const QVariantMap fields = outcome.toMap();
+        const QString code = fields.value(ARG_UPDATE_RESULT).toString();
+        const QString id = fields.value(ARG_ALARM_ID).toString();
+        if (code == kUnknownAlarmResult)
+            unknown.append(id);
+        else if (code != QLatin1String("0"))
+            failed.append(QStringLiteral("%1 (result code %2)").arg(id, code));
+    }
+    if (!failed.isEmpty())
+        return cli.fail(QStringLiteral("not updated: %1%2")
+                            .arg(failed.join(QLatin1String(", ")),
+                                 unknown.isEmpty()
+                                     ? QString()
+                                     : QStringLiteral("; ") + unknownAlarmsMessage(unknown)));
+    if (!unknown.isEmpty())
+        return cli.fail(unknownAlarmsMessage(unknown));
+    return Cli::ExitOk;
 }
 
 int history(Cli& cli, const QStringList& arguments)
@@ -156,13 +203,18 @@ int history(Cli& cli, const QStringList& arguments)
     const QString method = parser.isSet(QStringLiteral("export"))
                                ? METHOD_GET_ALARM_HISTORY_FOR_EXPORT
                                : METHOD_GET_ALARM_HISTORY;
+    const QString id = parser.positionalArguments().constFirst();
     QList<PluginAnswer> answers;
-    if (!cli.call(method, QVariantMap{{ARG_ALARM_ID, parser.positionalArguments().constFirst()}},
-                  &answers, &exitCode))
+    if (!cli.call(method, QVariantMap{{ARG_ALARM_ID, id}}, &answers, &exitCode))
         return exitCode;
+    if (answers.constLast().resultCode != QLatin1String("0")) {
+        // The server answers an alarm it does not know with a failure.
+        const QString lost = cli.host().tunnelClient().connectionError();
+        return cli.fail(lost.isEmpty() ? unknownAlarmsMessage({id}) : lost);
+    }
     for (const PluginAnswer& answer : std::as_const(answers))
         cli.printAnswer(method, answer);
-    return answeredOk(answers) ? Cli::ExitOk : Cli::ExitFailed;
+    return Cli::ExitOk;
 }
 
 int mute(Cli& cli, const QStringList& arguments)

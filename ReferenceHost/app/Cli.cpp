@@ -3,7 +3,9 @@
 #include "Commands.h"
 
 #include <AnswerFormat.h>
+#include <HostTunnelClient.h>
 #include <PluginLoader.h>
+#include <TimeArgument.h>
 
 #include <QCoreApplication>
 #include <QDir>
@@ -14,6 +16,21 @@
 namespace {
 
 const int kDefaultTimeoutSeconds = 30;
+
+// Any help option anywhere before a "--" asks for help and nothing else, whatever else the
+// command line holds.
+bool asksForHelp(const QStringList& arguments)
+{
+    static const QStringList helpOptions{QStringLiteral("-h"), QStringLiteral("--help"),
+                                         QStringLiteral("-?"), QStringLiteral("--help-all")};
+    for (const QString& argument : arguments.mid(1)) {
+        if (argument == QLatin1String("--"))
+            return false;
+        if (helpOptions.contains(argument))
+            return true;
+    }
+    return false;
+}
 
 } // namespace
 
@@ -41,8 +58,24 @@ Cli::Cli()
       m_timeoutOption(
           QStringLiteral("timeout"),
           QStringLiteral("Seconds to wait for an answer (default %1).").arg(kDefaultTimeoutSeconds),
-          QStringLiteral("seconds"))
+          QStringLiteral("seconds")),
+      m_verboseOption(QStringLiteral("verbose"),
+                      QStringLiteral("Let the plug-in's trace lines through to standard error.")),
+      m_tzOption(QStringLiteral("tz"),
+                 QStringLiteral("Time zone of times given without Z or an offset, and of times "
+                                "shown in tables and CSV: an IANA name such as Europe/Berlin, UTC "
+                                "or an offset such as +02:00 (default UTC)."),
+                 QStringLiteral("zone")),
+      m_localOption(QStringLiteral("local"),
+                    QStringLiteral("Use this machine's time zone, as --tz does."))
 {
+}
+
+QList<QCommandLineOption> Cli::globalOptions() const
+{
+    return {m_pluginOption,    m_serverOption, m_dbOption,   m_memoryOption,
+            m_seedCountOption, m_prettyOption, m_xmlOption,  m_timeoutOption,
+            m_verboseOption,   m_tzOption,     m_localOption};
 }
 
 Cli::~Cli() = default;
@@ -60,8 +93,7 @@ QString Cli::printHelp() const
         help += QStringLiteral("  %1%2\n").arg(command.name.leftJustified(10), command.summary);
     help += QStringLiteral("\nGlobal options (also accepted after the command):\n");
     QCommandLineParser parser;
-    parser.addOptions({m_pluginOption, m_serverOption, m_dbOption, m_memoryOption,
-                       m_seedCountOption, m_prettyOption, m_xmlOption, m_timeoutOption});
+    parser.addOptions(globalOptions());
     parser.addHelpOption();
     parser.addVersionOption();
     const QString options = parser.helpText();
@@ -72,35 +104,45 @@ QString Cli::printHelp() const
 
 int Cli::run(const QStringList& arguments)
 {
-    m_globalParser.addOptions({m_pluginOption, m_serverOption, m_dbOption, m_memoryOption,
-                               m_seedCountOption, m_prettyOption, m_xmlOption, m_timeoutOption});
-    const QCommandLineOption helpOption = m_globalParser.addHelpOption();
+    m_globalParser.addOptions(globalOptions());
+    m_globalParser.addHelpOption();
     const QCommandLineOption versionOption = m_globalParser.addVersionOption();
     m_globalParser.setOptionsAfterPositionalArgumentsMode(
         QCommandLineParser::ParseAsPositionalArguments);
-    if (!m_globalParser.parse(arguments))
-        return usageError(m_globalParser.errorText());
-    if (m_globalParser.isSet(versionOption)) {
-        printOut(QCoreApplication::applicationVersion().toUtf8() + '\n');
+    const bool help = asksForHelp(arguments);
+    const bool parsed = m_globalParser.parse(arguments);
+    QStringList positional = m_globalParser.positionalArguments();
+    if (help && parsed && !positional.isEmpty()) {
+        for (const Commands::Command& command : Commands::all()) {
+            if (command.name == positional.constFirst()) {
+                m_command = command.name;
+                // The command's parser shows its help; nothing runs.
+                return command.run(*this,
+                                   QStringList{arguments.value(0), QStringLiteral("--help")});
+            }
+        }
+    }
+    if (help) {
+        printOut(printHelp().toUtf8());
         return ExitOk;
     }
-
-    QStringList positional = m_globalParser.positionalArguments();
+    if (!parsed)
+        return usageError(m_globalParser.errorText());
+    if (m_globalParser.isSet(versionOption)) {
+        printOut(
+            QStringLiteral("%1 %2\n")
+                .arg(QCoreApplication::applicationName(), QCoreApplication::applicationVersion())
+                .toUtf8());
+        return ExitOk;
+    }
     if (positional.isEmpty()) {
-        if (m_globalParser.isSet(helpOption)) {
-            printOut(printHelp().toUtf8());
-            return ExitOk;
-        }
         std::fputs(qPrintable(printHelp()), stderr);
         return ExitUsage;
     }
     m_command = positional.takeFirst();
     for (const Commands::Command& command : Commands::all()) {
-        if (command.name != m_command)
-            continue;
-        if (m_globalParser.isSet(helpOption))
-            positional.append(QStringLiteral("--help"));
-        return command.run(*this, QStringList{arguments.value(0)} + positional);
+        if (command.name == m_command)
+            return command.run(*this, QStringList{arguments.value(0)} + positional);
     }
     return usageError(
         QStringLiteral("unknown command \"%1\"; see 'alarmsearch --help'").arg(m_command));
@@ -108,14 +150,9 @@ int Cli::run(const QStringList& arguments)
 
 bool Cli::parseCommand(QCommandLineParser& parser, const QStringList& arguments, int* exitCode)
 {
-    parser.addOptions({m_pluginOption, m_serverOption, m_dbOption, m_memoryOption,
-                       m_seedCountOption, m_prettyOption, m_xmlOption, m_timeoutOption});
-    const QCommandLineOption helpOption = parser.addHelpOption();
-    if (!parser.parse(arguments)) {
-        *exitCode = usageError(parser.errorText());
-        return false;
-    }
-    if (parser.isSet(helpOption)) {
+    parser.addOptions(globalOptions());
+    parser.addHelpOption();
+    if (asksForHelp(arguments)) {
         QString help = parser.helpText();
         help.replace(QCoreApplication::arguments().value(0),
                      QStringLiteral("alarmsearch ") + m_command);
@@ -123,7 +160,32 @@ bool Cli::parseCommand(QCommandLineParser& parser, const QStringList& arguments,
         *exitCode = ExitOk;
         return false;
     }
+    if (!parser.parse(arguments)) {
+        *exitCode = usageError(parser.errorText());
+        return false;
+    }
     m_commandParser = &parser;
+    return readTimeZone(exitCode);
+}
+
+bool Cli::readTimeZone(int* exitCode)
+{
+    if (isSet(m_tzOption) && isSet(m_localOption)) {
+        *exitCode = usageError(QStringLiteral("--tz and --local exclude each other"));
+        return false;
+    }
+    if (isSet(m_localOption))
+        m_timeZone = QTimeZone::systemTimeZone();
+    if (isSet(m_tzOption)) {
+        m_timeZone = TimeArgument::zoneNamed(value(m_tzOption));
+        if (!m_timeZone.isValid()) {
+            *exitCode = usageError(QStringLiteral("unknown time zone \"%1\" (expected a name such "
+                                                  "as Europe/Berlin, UTC, or an offset such as "
+                                                  "+02:00)")
+                                       .arg(value(m_tzOption)));
+            return false;
+        }
+    }
     return true;
 }
 
@@ -150,6 +212,12 @@ int Cli::timeoutMs() const
     return (seconds > 0 ? seconds : kDefaultTimeoutSeconds) * 1000;
 }
 
+bool Cli::embeddedServerDefault() const
+{
+    return !isSet(m_serverOption) && !isSet(m_dbOption) && !isSet(m_memoryOption) &&
+           !isSet(m_seedCountOption);
+}
+
 bool Cli::openHost(int* exitCode)
 {
     ReferenceHost::Options options;
@@ -168,6 +236,7 @@ bool Cli::openHost(int* exitCode)
                                               "--db and --memory are for the embedded one"));
         return false;
     }
+    bool seeds = false;
     if (isSet(m_memoryOption)) {
         options.embedded.databasePath = QStringLiteral(":memory:");
     } else {
@@ -175,6 +244,7 @@ bool Cli::openHost(int* exitCode)
                                             ? value(m_dbOption)
                                             : AlarmServerSim::AlarmServer::defaultDatabasePath();
         QDir().mkpath(QFileInfo(options.embedded.databasePath).absolutePath());
+        seeds = !QFileInfo::exists(options.embedded.databasePath);
     }
     if (isSet(m_seedCountOption)) {
         bool ok = false;
@@ -184,11 +254,20 @@ bool Cli::openHost(int* exitCode)
             return false;
         }
     }
-    return openHost(options, exitCode);
+    if (!openHost(options, exitCode))
+        return false;
+    if (seeds && options.serverAddress.isEmpty())
+        printNote(QStringLiteral("created the database %1 with %2 demo alarms")
+                      .arg(options.embedded.databasePath)
+                      .arg(options.embedded.seedCount));
+    return true;
 }
 
 bool Cli::openHost(const ReferenceHost::Options& options, int* exitCode)
 {
+    // The trace library reads its settings when the plug-in loads it.
+    if (!isSet(m_verboseOption) && !qEnvironmentVariableIsSet("ZOLTLOG_FILE"))
+        qputenv("ZOLTLOG_LEVEL", "0");
     m_host = std::make_unique<ReferenceHost>();
     QString error;
     if (!m_host->open(options, &error)) {
@@ -207,6 +286,16 @@ bool Cli::call(const QString& method, const QVariant& args, QList<PluginAnswer>*
         return true;
     *exitCode = fail(error);
     return false;
+}
+
+QString Cli::answerError(const QString& method, const PluginAnswer& answer)
+{
+    const QString lost = m_host ? m_host->tunnelClient().connectionError() : QString();
+    if (!lost.isEmpty())
+        return lost;
+    if (answer.resultCode.isEmpty())
+        return QStringLiteral("%1 failed without a result code").arg(method);
+    return QStringLiteral("%1 failed with result code %2").arg(method, answer.resultCode);
 }
 
 void Cli::printOut(const QByteArray& bytes)
@@ -247,13 +336,14 @@ int Cli::usageError(const QString& message)
     return fail(message, ExitUsage);
 }
 
-void Cli::addFilterOptions(QCommandLineParser& parser)
+void Cli::addFilterOptions(QCommandLineParser& parser, const QString& allText)
 {
     parser.addOptions({
         {QStringLiteral("unhandled"),
          QStringLiteral("Only unhandled alarms (method QryUnhandledAlarm).")},
         {QStringLiteral("event"),
-         QStringLiteral("Trigger event, e.g. CamEvent:Motion or StationConn; repeatable."),
+         QStringLiteral("Trigger event, e.g. CamEvent:Motion or StationConn, in any letter case "
+                        "('alarmsearch classes' lists them); repeatable."),
          QStringLiteral("class[:subevent]")},
         {QStringLiteral("events"),
          QStringLiteral("All trigger events of a group: camera, system or external; repeatable."),
@@ -262,22 +352,23 @@ void Cli::addFilterOptions(QCommandLineParser& parser)
          QStringLiteral("Alarm state: Unhandled, Processing, Handled or FalseAlarm; repeatable."),
          QStringLiteral("state")},
         {QStringLiteral("from"),
-         QStringLiteral("Oldest alarm time (UTC): yyyy-MM-ddTHH:mm:ss, a date, or an age like "
-                        "24h or 7d."),
+         QStringLiteral("Oldest alarm time: ISO 8601 (2026-11-20T08:15:30Z, an offset such as "
+                        "+01:00), \"2026-11-20 08:15[:30]\" (in the --tz zone), a date, now, or "
+                        "an age such as 30m, 24h, 7d or 2w."),
          QStringLiteral("time")},
         {QStringLiteral("to"), QStringLiteral("Newest alarm time, in the same forms as --from."),
          QStringLiteral("time")},
         {QStringLiteral("name"), QStringLiteral("Alarm name; repeatable."), QStringLiteral("name")},
         {QStringLiteral("device"), QStringLiteral("Trigger device name; repeatable."),
          QStringLiteral("name")},
-        {QStringLiteral("all"),
-         QStringLiteral("Fetch every match, past the server's 5000 alarms per search.")},
+        {QStringLiteral("all"), allText},
     });
 }
 
-QueryFilter Cli::readFilter(const QCommandLineParser& parser)
+QueryFilter Cli::readFilter(const QCommandLineParser& parser) const
 {
     QueryFilter filter;
+    filter.zone = m_timeZone;
     filter.unhandledOnly = parser.isSet(QStringLiteral("unhandled"));
     filter.events = parser.values(QStringLiteral("event"));
     filter.eventGroups = parser.values(QStringLiteral("events"));

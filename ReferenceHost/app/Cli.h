@@ -7,6 +7,7 @@
 #include <QCommandLineOption>
 #include <QCommandLineParser>
 #include <QMutex>
+#include <QTimeZone>
 
 #include <memory>
 
@@ -28,6 +29,9 @@ public:
     // Opens the host as the global options say: the plug-in file, the server or database.
     bool openHost(int* exitCode);
     bool openHost(const ReferenceHost::Options& options, int* exitCode);
+    // Whether the command line leaves the server alone: no --server, --db, --memory or
+    // --seed-count.
+    bool embeddedServerDefault() const;
     HostSession& session() { return m_host->session(); }
     ReferenceHost& host() { return *m_host; }
 
@@ -40,6 +44,8 @@ public:
     int timeoutMs() const;
     bool pretty() const { return isSet(m_prettyOption); }
     bool keepXml() const { return isSet(m_xmlOption); }
+    // The zone of times read without "Z" or an offset and of times shown: --tz, --local or UTC.
+    QTimeZone timeZone() const { return m_timeZone; }
 
     void printOut(const QByteArray& bytes);
     void printAnswer(const QString& method, const PluginAnswer& answer);
@@ -48,14 +54,19 @@ public:
     void printNote(const QString& message);
     int fail(const QString& message, int exitCode = ExitFailed);
     int usageError(const QString& message);
+    // Why a request failed: a lost connection by name, else the method and its result code.
+    QString answerError(const QString& method, const PluginAnswer& answer);
 
-    static void addFilterOptions(QCommandLineParser& parser);
-    static QueryFilter readFilter(const QCommandLineParser& parser);
+    // The search options; allText describes --all.
+    static void addFilterOptions(QCommandLineParser& parser, const QString& allText);
+    QueryFilter readFilter(const QCommandLineParser& parser) const;
     // Identifiers given as positional arguments and with --id.
     static QStringList alarmIds(const QCommandLineParser& parser);
 
 private:
     QString printHelp() const;
+    QList<QCommandLineOption> globalOptions() const;
+    bool readTimeZone(int* exitCode);
     bool isSet(const QCommandLineOption& option) const;
     QString value(const QCommandLineOption& option) const;
 
@@ -67,9 +78,13 @@ private:
     QCommandLineOption m_prettyOption;
     QCommandLineOption m_xmlOption;
     QCommandLineOption m_timeoutOption;
+    QCommandLineOption m_verboseOption;
+    QCommandLineOption m_tzOption;
+    QCommandLineOption m_localOption;
     QCommandLineParser m_globalParser;
     const QCommandLineParser* m_commandParser = nullptr;
     QString m_command;
+    QTimeZone m_timeZone = QTimeZone::utc();
     QMutex m_outputMutex;
     std::unique_ptr<ReferenceHost> m_host;
 };

@@ -10,6 +10,8 @@ const QList<Command>& all()
         {QStringLiteral("history"), QStringLiteral("Show the change history of an alarm"), history},
         {QStringLiteral("mute"), QStringLiteral("Mute alarms for a while"), mute},
         {QStringLiteral("unmute"), QStringLiteral("Unmute alarms"), unmute},
+        {QStringLiteral("classes"),
+         QStringLiteral("List the event classes and sub-events that --event takes"), classes},
         {QStringLiteral("events"), QStringLiteral("Print AlarmUpdated events as they happen"),
          events},
         {QStringLiteral("export"),

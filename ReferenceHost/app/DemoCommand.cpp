@@ -1,5 +1,8 @@
 #include "Cli.h"
 #include "Commands.h"
+#include "Terminal.h"
+
+#include <AlarmTable.h>
 
 #include <AnswerFormat.h>
 #include <HostTunnelClient.h>
@@ -64,8 +67,9 @@ bool DemoScript::request(const QString& method, const QVariantMap& args, PluginA
 
 void DemoScript::showAlarms(const QVariantList& alarms)
 {
-    const QString table = AnswerFormat::alarmTable(alarms.mid(0, kRowsShown));
-    for (const QString& line : table.split(QLatin1Char('\n'), Qt::SkipEmptyParts))
+    AlarmTable table(m_cli.timeZone(), qMax(0, terminalWidth() - 6));
+    const QString lines = table.page(alarms.mid(0, kRowsShown));
+    for (const QString& line : lines.split(QLatin1Char('\n'), Qt::SkipEmptyParts))
         say(QStringLiteral("   ") + line);
     if (alarms.size() > kRowsShown)
         say(QStringLiteral("   ... and %1 more").arg(alarms.size() - kRowsShown));
@@ -205,6 +209,9 @@ int demo(Cli& cli, const QStringList& arguments)
     int exitCode = Cli::ExitOk;
     if (!cli.parseCommand(parser, arguments, &exitCode))
         return exitCode;
+    if (!cli.embeddedServerDefault())
+        return cli.usageError(QStringLiteral("demo runs its own in-memory server; --server, --db, "
+                                             "--memory and --seed-count do not apply to it"));
     DemoScript script(cli);
     return script.run();
 }

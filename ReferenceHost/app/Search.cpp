@@ -2,11 +2,10 @@
 
 #include "Cli.h"
 
-#include <AlarmPager.h>
 #include <AnswerFormat.h>
 
 bool runSearch(Cli& cli, const QString& method, const QVariantMap& args, bool all,
-               QVariantList* alarms, int* exitCode)
+               const AlarmPager::PageSink& sink, bool* truncated, int* exitCode)
 {
     const AlarmPager::PageQuery searchOnce = [&](const QVariantMap& windowArgs, QVariantList* page,
                                                  QString* error) {
@@ -15,7 +14,7 @@ bool runSearch(Cli& cli, const QString& method, const QVariantMap& args, bool al
             return false;
         const PluginAnswer& answer = answers.constLast();
         if (answer.resultCode != QLatin1String("0")) {
-            *error = QStringLiteral("%1 failed with result code %2").arg(method, answer.resultCode);
+            *error = cli.answerError(method, answer);
             return false;
         }
         *page = AnswerFormat::alarms(answer, cli.keepXml());
@@ -24,24 +23,27 @@ bool runSearch(Cli& cli, const QString& method, const QVariantMap& args, bool al
 
     QString error;
     if (!all) {
-        if (!searchOnce(args, alarms, &error)) {
+        QVariantList page;
+        if (!searchOnce(args, &page, &error) || !sink(page, &error)) {
             *exitCode = cli.fail(error);
             return false;
         }
-        if (alarms->size() >= AlarmPager::kMaxRecords)
+        *truncated = page.size() >= AlarmPager::kMaxRecords;
+        if (*truncated)
             cli.printError(QStringLiteral("the server returned %1 alarms, its limit per search: "
                                           "older matches may be missing; use --all to fetch "
                                           "them all")
-                               .arg(alarms->size()));
+                               .arg(page.size()));
         return true;
     }
 
     AlarmPager pager(searchOnce);
-    if (!pager.fetchAll(args, alarms, &error)) {
+    if (!pager.fetchAll(args, sink, &error)) {
         *exitCode = cli.fail(error);
         return false;
     }
-    if (!pager.warning().isEmpty())
+    *truncated = !pager.warning().isEmpty();
+    if (*truncated)
         cli.printError(pager.warning());
     return true;
 }

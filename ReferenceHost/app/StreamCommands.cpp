@@ -1,30 +1,28 @@
 #include "Cli.h"
 #include "Commands.h"
+#include "Search.h"
+#include "Terminal.h"
 
 #include <AnswerFormat.h>
+#include <BatchRequest.h>
 #include <HostTunnelClient.h>
 
 #include <PluginAlarmSearchCommon.h>
 #include <PluginObjBase_EventInfo.h>
 
 #include <QCoreApplication>
+#include <QDateTime>
 #include <QFile>
 #include <QJsonDocument>
 #include <QJsonObject>
 #include <QWaitCondition>
 
-#include <csignal>
-
 using namespace PluginAlarmSearchCommon;
 
 namespace {
 
-volatile std::sig_atomic_t g_interrupted = 0;
-
-extern "C" void onInterrupt(int)
-{
-    g_interrupted = 1;
-}
+// A request line is a few hundred bytes; anything near this is no request.
+const qint64 kMaxLineLength = 1 << 20;
 
 QString subscriptionKey(const QString& purpose)
 {
@@ -36,6 +34,37 @@ EventHub::Listener eventPrinter(Cli& cli)
     return [&cli](const PluginObjBase_EventSignalInfo& info) {
         cli.printOut(AnswerFormat::jsonLine(AnswerFormat::eventObject(info), cli.pretty()));
     };
+}
+
+// Answers a search line: one search, or with "all" every time window; either way one answer
+// carrying "truncated", true when matches may be missing.
+bool answerSearch(Cli& cli, const BatchRequest& request, bool* ok, int* exitCode)
+{
+    PluginAnswer answer;
+    bool truncated = false;
+    if (request.all) {
+        QVariantList alarms;
+        const AlarmPager::PageSink collect = [&alarms](const QVariantList& page, QString*) {
+            alarms += page;
+            return true;
+        };
+        if (!runSearch(cli, request.method, request.args, true, collect, &truncated, exitCode))
+            return false;
+        answer = PluginAnswer{true, QStringLiteral("0"), QString(),
+                              QVariantMap{{ARG_QUERY_RESULT, alarms},
+                                          {ARG_RELAY_PATH, request.args.value(ARG_RELAY_PATH)}}};
+    } else {
+        QList<PluginAnswer> answers;
+        if (!cli.call(request.method, request.args, &answers, exitCode))
+            return false;
+        answer = answers.constLast();
+        truncated = AnswerFormat::alarms(answer, false).size() >= AlarmPager::kMaxRecords;
+    }
+    QJsonObject object = AnswerFormat::answerObject(request.method, answer, cli.keepXml());
+    object.insert(QStringLiteral("truncated"), truncated);
+    cli.printOut(AnswerFormat::jsonLine(object, cli.pretty()));
+    *ok = *ok && answer.resultCode == QLatin1String("0");
+    return true;
 }
 
 } // namespace
@@ -75,13 +104,12 @@ int events(Cli& cli, const QStringList& arguments)
                                 ++received;
                                 arrived.wakeAll();
                             });
-    std::signal(SIGINT, onInterrupt);
-    std::signal(SIGTERM, onInterrupt);
+    catchInterrupts();
     cli.printNote(QStringLiteral("waiting for %1 events; Ctrl-C to stop").arg(EVENT_ALARM_UPDATED));
     {
         QMutexLocker locker(&mutex);
         // Short waits, so that a signal is noticed soon.
-        while (!g_interrupted && (count == 0 || received < count))
+        while (!interrupted() && (count == 0 || received < count))
             arrived.wait(&mutex, 200);
     }
     cli.session().unsubscribe(key);
@@ -93,9 +121,11 @@ int batch(Cli& cli, const QStringList& arguments)
     QCommandLineParser parser;
     parser.setApplicationDescription(QStringLiteral(
         "Reads one request per line from standard input, {\"method\": \"QryAlarmList\", "
-        "\"args\": {...}}, and prints one JSON line per answer. MuteAlarm, which gets no "
-        "answer, prints {\"method\": \"MuteAlarm\", \"sent\": true}. Stops at the first line "
-        "that is no request."));
+        "\"args\": {...}}, and prints one JSON line per answer. Unknown keys and values of the "
+        "wrong type are refused; the README lists the keys of each method. Searches take "
+        "\"all\": true to walk every time window, and their answers carry \"truncated\". "
+        "MuteAlarm, which gets no answer, prints {\"method\": \"MuteAlarm\", \"sent\": true}. "
+        "Stops at the first line that is no valid request."));
     parser.addOption({QStringLiteral("events"),
                       QStringLiteral("Also print the AlarmUpdated events of the updates.")});
     int exitCode = Cli::ExitOk;
@@ -107,18 +137,17 @@ int batch(Cli& cli, const QStringList& arguments)
     if (parser.isSet(QStringLiteral("events")))
         cli.session().subscribe(key, EVENT_ALARM_UPDATED, eventPrinter(cli));
 
-    static const QStringList methods{METHOD_QUERY_UNHANDLED_ALARM,
-                                     METHOD_QUERY_ALARM_LIST,
-                                     METHOD_UPDATE_ALARM,
-                                     METHOD_GET_ALARM_HISTORY,
-                                     METHOD_GET_ALARM_HISTORY_FOR_EXPORT,
-                                     METHOD_MUTE_ALARM};
     QFile input;
     if (!input.open(stdin, QIODevice::ReadOnly))
         return cli.fail(QStringLiteral("cannot read standard input"));
     bool allOk = true;
     for (int lineNumber = 1; !input.atEnd(); ++lineNumber) {
-        const QByteArray line = input.readLine().trimmed();
+        QByteArray line = input.readLine(kMaxLineLength + 1);
+        if (line.size() > kMaxLineLength)
+            return cli.usageError(QStringLiteral("line %1: longer than %2 bytes")
+                                      .arg(lineNumber)
+                                      .arg(kMaxLineLength));
+        line = line.trimmed();
         if (line.isEmpty())
             continue;
         QJsonParseError parseError;
@@ -127,20 +156,17 @@ int batch(Cli& cli, const QStringList& arguments)
             return cli.usageError(QStringLiteral("line %1: bad JSON: %2")
                                       .arg(lineNumber)
                                       .arg(parseError.errorString()));
-        const QJsonObject request = document.object();
-        const QString method = request.value(QLatin1String("method")).toString();
-        const QJsonValue args = request.value(QLatin1String("args"));
-        if (!document.isObject() || !methods.contains(method))
-            return cli.usageError(QStringLiteral("line %1: \"method\" must be one of %2")
-                                      .arg(lineNumber)
-                                      .arg(methods.join(QLatin1String(", "))));
-        if (!args.isObject() && !args.isUndefined())
+        BatchRequest request;
+        QString error;
+        if (!document.isObject())
             return cli.usageError(
-                QStringLiteral("line %1: \"args\" must be an object").arg(lineNumber));
-
-        const QVariantMap argMap = args.toObject().toVariantMap();
+                QStringLiteral("line %1: a request is a JSON object").arg(lineNumber));
+        if (!BatchRequest::read(document.object(), QDateTime::currentDateTimeUtc(), cli.timeZone(),
+                                &request, &error))
+            return cli.usageError(QStringLiteral("line %1: %2").arg(lineNumber).arg(error));
+        const QString& method = request.method;
         if (method == METHOD_MUTE_ALARM) {
-            cli.session().send(method, argMap);
+            cli.session().send(method, request.args);
             // Later lines must see the mute carried out.
             if (!cli.host().tunnelClient().waitForIdle(cli.timeoutMs()))
                 return cli.fail(
@@ -150,8 +176,13 @@ int batch(Cli& cli, const QStringList& arguments)
                 cli.pretty()));
             continue;
         }
+        if (method == METHOD_QUERY_ALARM_LIST || method == METHOD_QUERY_UNHANDLED_ALARM) {
+            if (!answerSearch(cli, request, &allOk, &exitCode))
+                return exitCode;
+            continue;
+        }
         QList<PluginAnswer> answers;
-        if (!cli.call(method, argMap, &answers, &exitCode))
+        if (!cli.call(method, request.args, &answers, &exitCode))
             return exitCode;
         for (const PluginAnswer& answer : std::as_const(answers)) {
             cli.printAnswer(method, answer);

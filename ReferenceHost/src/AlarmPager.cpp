@@ -13,36 +13,45 @@ const QString kServerTime = QStringLiteral("ServerTime");
 
 } // namespace
 
-bool AlarmPager::fetchAll(const QVariantMap& args, QVariantList* alarms, QString* errorMessage)
+bool AlarmPager::fetchAll(const QVariantMap& args, const PageSink& sink, QString* errorMessage)
 {
-    alarms->clear();
     m_pages = 0;
+    m_alarmCount = 0;
     m_warning.clear();
-    QSet<QString> seen;
+    QSet<QString> boundaryIds; // the alarms of the previous page at its oldest second
     QVariantMap window = args;
     for (;;) {
         QVariantList page;
         if (!m_query(window, &page, errorMessage))
             return false;
         ++m_pages;
-        int added = 0;
+        QVariantList added;
+        added.reserve(page.size());
         for (const QVariant& alarm : std::as_const(page)) {
-            const QString id = alarm.toMap().value(kAlarmId).toString();
-            if (!seen.contains(id)) {
-                seen.insert(id);
-                alarms->append(alarm);
-                ++added;
-            }
+            if (!boundaryIds.contains(alarm.toMap().value(kAlarmId).toString()))
+                added.append(alarm);
         }
+        m_alarmCount += added.size();
+        if (!added.isEmpty() && !sink(added, errorMessage))
+            return false;
         if (page.size() < kMaxRecords)
             return true;
         const QString oldest = page.constLast().toMap().value(kServerTime).toString();
         const QDateTime oldestTime = QDateTime::fromString(oldest, Qt::ISODate);
-        if (added == 0 || !oldestTime.isValid()) {
+        if (added.isEmpty() || !oldestTime.isValid()) {
             m_warning = QStringLiteral("more than %1 alarms at %2; some of them may be missing")
                             .arg(kMaxRecords)
                             .arg(oldest);
             return true;
+        }
+        // Alarms at the oldest second seen come back in the next window; remember all of them
+        // (those of earlier pages at that second included).
+        if (page.constFirst().toMap().value(kServerTime).toString() != oldest)
+            boundaryIds.clear();
+        for (const QVariant& alarm : std::as_const(page)) {
+            const QVariantMap fields = alarm.toMap();
+            if (fields.value(kServerTime).toString() == oldest)
+                boundaryIds.insert(fields.value(kAlarmId).toString());
         }
         window.insert(PluginAlarmSearchCommon::ARG_END_TIME,
                       TimeArgument::toServerTime(oldestTime));

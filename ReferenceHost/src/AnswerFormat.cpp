@@ -70,55 +70,18 @@ QVariantList AnswerFormat::alarms(const PluginAnswer& answer, bool keepXml)
     return result.toMap().value(ARG_QUERY_RESULT).toList();
 }
 
-QString AnswerFormat::alarmTable(const QVariantList& alarms)
+QJsonObject AnswerFormat::alarmObject(const QVariantMap& alarm)
 {
-    struct Column
-    {
-        QString title;
-        QStringList keys; // joined with ":" when several are set
-    };
-    static const QList<Column> columns{
-        {QStringLiteral("ALARM"), {QStringLiteral("AlarmID")}},
-        {QStringLiteral("TIME (UTC)"), {QStringLiteral("ServerTime")}},
-        {QStringLiteral("STATE"), {QStringLiteral("State")}},
-        {QStringLiteral("EVENT"), {QStringLiteral("EventClass"), QStringLiteral("SubEvent")}},
-        {QStringLiteral("NAME"), {QStringLiteral("AlarmName")}},
-        {QStringLiteral("DEVICE"), {QStringLiteral("DeviceName")}},
-        {QStringLiteral("MUTED"), {QStringLiteral("Muted")}},
-        {QStringLiteral("NOTE"), {QStringLiteral("Note")}},
-    };
+    return QJsonObject::fromVariantMap(alarm);
+}
 
-    QList<QStringList> rows;
-    QStringList header;
-    for (const Column& column : columns)
-        header.append(column.title);
-    rows.append(header);
-    for (const QVariant& alarm : alarms) {
-        const QVariantMap fields = alarm.toMap();
-        QStringList row;
-        for (const Column& column : columns) {
-            QStringList parts;
-            for (const QString& key : column.keys) {
-                const QString value = fields.value(key).toString();
-                if (!value.isEmpty())
-                    parts.append(value);
-            }
-            row.append(parts.join(QLatin1Char(':')).simplified());
-        }
-        rows.append(row);
-    }
-
-    QList<qsizetype> widths(columns.size(), 0);
-    for (const QStringList& row : std::as_const(rows)) {
-        for (qsizetype i = 0; i < row.size(); ++i)
-            widths[i] = qMax(widths[i], row[i].size());
-    }
-    QString table;
-    for (const QStringList& row : std::as_const(rows)) {
-        QString line;
-        for (qsizetype i = 0; i < row.size(); ++i)
-            line += i + 1 < row.size() ? row[i].leftJustified(widths[i] + 2) : row[i];
-        table += line.trimmed() + QLatin1Char('\n');
-    }
-    return table;
+QByteArray AnswerFormat::jsonText(const QJsonObject& object, bool pretty, int indent)
+{
+    QByteArray text =
+        QJsonDocument(object).toJson(pretty ? QJsonDocument::Indented : QJsonDocument::Compact);
+    if (text.endsWith('\n'))
+        text.chop(1);
+    if (pretty)
+        text.replace("\n", "\n" + QByteArray(indent, ' '));
+    return text;
 }

@@ -21,6 +21,10 @@ public:
 
     // The alarms of a search answer ("queryResult"), without their XML unless keepXml.
     static QVariantList alarms(const PluginAnswer& answer, bool keepXml);
-    // A compact text table: one line per alarm under a header.
-    static QString alarmTable(const QVariantList& alarms);
+    // One alarm of a search as a JSON object: the one place that decides how an alarm's fields
+    // look in JSON output, for answers, JSON lines and exports alike.
+    static QJsonObject alarmObject(const QVariantMap& alarm);
+    // An object written as JSON text, its lines after the first indented by indent spaces when
+    // pretty, with no line feed at the end.
+    static QByteArray jsonText(const QJsonObject& object, bool pretty, int indent);
 };

@@ -1,5 +1,8 @@
 #include "ExportWriter.h"
 
+#include "AnswerFormat.h"
+#include "TimeArgument.h"
+
 #include <QJsonArray>
 #include <QJsonDocument>
 #include <QJsonObject>
@@ -14,58 +17,81 @@ const QStringList kAlarmColumns{
     QStringLiteral("Muted"),    QStringLiteral("MuteUntil")};
 const QStringList kEntryColumns{QStringLiteral("Time"), QStringLiteral("State"),
                                 QStringLiteral("Note"), QStringLiteral("User")};
+const QStringList kTimeColumns{QStringLiteral("ServerTime"), QStringLiteral("MuteUntil"),
+                               QStringLiteral("Time")};
 
-QString csvField(const QString& value)
-{
-    if (!value.contains(QLatin1Char(',')) && !value.contains(QLatin1Char('"')) &&
-        !value.contains(QLatin1Char('\n')) && !value.contains(QLatin1Char('\r')))
-        return value;
-    QString quoted = value;
-    quoted.replace(QLatin1Char('"'), QLatin1String("\"\""));
-    return QLatin1Char('"') + quoted + QLatin1Char('"');
-}
-
-QString csvRow(const QStringList& fields)
-{
-    QStringList escaped;
-    for (const QString& field : fields)
-        escaped.append(csvField(field));
-    return escaped.join(QLatin1Char(',')) + QLatin1String("\r\n");
-}
-
-QStringList values(const QVariantMap& map, const QStringList& keys)
+QStringList values(const QVariantMap& map, const QStringList& keys, const QTimeZone& zone)
 {
     QStringList out;
-    for (const QString& key : keys)
-        out.append(map.value(key).toString());
+    for (const QString& key : keys) {
+        const QString value = map.value(key).toString();
+        out.append(kTimeColumns.contains(key) ? TimeArgument::display(value, zone) : value);
+    }
     return out;
 }
 
 } // namespace
 
-QByteArray ExportWriter::toCsv(const QList<ExportedAlarm>& alarms)
+QStringList ExportWriter::csvColumns()
 {
     QStringList header = kAlarmColumns;
     for (const QString& column : kEntryColumns)
         header.append(QStringLiteral("Change") + column);
-    QString csv = csvRow(header);
-    for (const ExportedAlarm& exported : alarms) {
-        const QStringList alarmFields = values(exported.alarm, kAlarmColumns);
-        if (exported.history.isEmpty())
-            csv += csvRow(alarmFields + QStringList(kEntryColumns.size()));
-        for (const QVariant& entry : exported.history)
-            csv += csvRow(alarmFields + values(entry.toMap(), kEntryColumns));
+    return header;
+}
+
+QString ExportWriter::csvField(const QString& value, bool raw)
+{
+    static const QString formulaStarts = QStringLiteral("=+-@\t\r");
+    QString field = value;
+    if (!raw && !field.isEmpty() && formulaStarts.contains(field.front()))
+        field.prepend(QLatin1Char('\''));
+    if (!field.contains(QLatin1Char(',')) && !field.contains(QLatin1Char('"')) &&
+        !field.contains(QLatin1Char('\n')) && !field.contains(QLatin1Char('\r')))
+        return field;
+    field.replace(QLatin1Char('"'), QLatin1String("\"\""));
+    return QLatin1Char('"') + field + QLatin1Char('"');
+}
+
+QByteArray ExportWriter::begin() const
+{
+    if (m_options.json)
+        return "[";
+    QStringList header;
+    for (const QString& column : csvColumns())
+        header.append(csvField(column, true));
+    return (m_options.byteOrderMark ? QByteArray("\xEF\xBB\xBF") : QByteArray()) +
+           header.join(QLatin1Char(',')).toUtf8() + "\r\n";
+}
+
+QByteArray ExportWriter::alarm(const ExportedAlarm& exported)
+{
+    if (m_options.json) {
+        QJsonObject object = AnswerFormat::alarmObject(exported.alarm);
+        object.insert(QStringLiteral("history"), QJsonArray::fromVariantList(exported.history));
+        const QByteArray separator = m_written++ > 0 ? "," : "";
+        return separator + (m_options.pretty ? "\n    " : "") +
+               AnswerFormat::jsonText(object, m_options.pretty, 4);
+    }
+    ++m_written;
+    const QStringList alarmFields = values(exported.alarm, kAlarmColumns, m_options.zone);
+    QList<QStringList> rows;
+    for (const QVariant& entry : exported.history)
+        rows.append(alarmFields + values(entry.toMap(), kEntryColumns, m_options.zone));
+    if (rows.isEmpty())
+        rows.append(alarmFields + QStringList(kEntryColumns.size()));
+    QString csv;
+    for (const QStringList& row : std::as_const(rows)) {
+        for (qsizetype i = 0; i < row.size(); ++i)
+            csv += (i > 0 ? QStringLiteral(",") : QString()) + csvField(row[i], m_options.raw);
+        csv += QLatin1String("\r\n");
     }
     return csv.toUtf8();
 }
 
-QByteArray ExportWriter::toJson(const QList<ExportedAlarm>& alarms, bool pretty)
+QByteArray ExportWriter::end() const
 {
-    QJsonArray array;
-    for (const ExportedAlarm& exported : alarms) {
-        QJsonObject object = QJsonObject::fromVariantMap(exported.alarm);
-        object.insert(QStringLiteral("history"), QJsonArray::fromVariantList(exported.history));
-        array.append(object);
-    }
-    return QJsonDocument(array).toJson(pretty ? QJsonDocument::Indented : QJsonDocument::Compact);
+    if (!m_options.json)
+        return QByteArray();
+    return m_options.pretty && m_written > 0 ? "\n]\n" : "]\n";
 }

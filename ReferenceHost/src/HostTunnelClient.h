@@ -10,4 +10,7 @@ class HostTunnelClient : public IOrvoTunnelClient
 public:
     // Waits until every accepted request has been carried out and answered; false on timeout.
     virtual bool waitForIdle(int timeoutMs) = 0;
+    // Why requests fail for want of a connection ("connection to 127.0.0.1:47800 lost"); empty
+    // while requests can reach the server.
+    virtual QString connectionError() const { return QString(); }
 };

@@ -1,35 +1,15 @@
 #include "QueryArguments.h"
 
+#include "EventCatalog.h"
 #include "TimeArgument.h"
 
 #include <PluginAlarmSearchCommon.h>
-
-#include <QRegularExpression>
 
 using namespace PluginAlarmSearchCommon;
 
 namespace {
 
 const QString kUnhandled = QStringLiteral("Unhandled");
-
-// The attribute that names a sub-event of an event class, as the ready-made filters use it:
-// "CameraEvent" for "CamEvent", "VCAEvent" for "VCA" and so on.
-QString subEventAttribute(const QString& eventClass)
-{
-    static const QRegularExpression pattern(
-        QStringLiteral("<Event (\\w+)=\"[^\"]*\">([^<]+)</Event>"));
-    for (const QString* filter :
-         {&CAMERA_TRIGGER_EVENT_FILTER_STRING, &SYSTEM_TRIGGER_EVENT_FILTER_STRING,
-          &EXTERNAL_DEVICE_TRIGGER_EVENT_FILTER_STRING}) {
-        auto matches = pattern.globalMatch(*filter);
-        while (matches.hasNext()) {
-            const QRegularExpressionMatch match = matches.next();
-            if (match.captured(2) == eventClass)
-                return match.captured(1);
-        }
-    }
-    return QString();
-}
 
 } // namespace
 
@@ -60,46 +40,12 @@ bool QueryArguments::canonicalState(const QString& text, QString* state, QString
     return false;
 }
 
-bool QueryArguments::eventElement(const QString& event, QString* element, QString* errorMessage)
+QString QueryArguments::stateFilter(const QStringList& states)
 {
-    const qsizetype colon = event.indexOf(QLatin1Char(':'));
-    const QString eventClass = event.left(colon).trimmed();
-    if (eventClass.isEmpty()) {
-        *errorMessage =
-            QStringLiteral("bad event \"%1\": expected CLASS or CLASS:SUBEVENT").arg(event);
-        return false;
-    }
-    if (colon < 0) {
-        *element = QStringLiteral("<Event>%1</Event>").arg(eventClass.toHtmlEscaped());
-        return true;
-    }
-    const QString subEvent = event.mid(colon + 1).trimmed();
-    const QString attribute = subEventAttribute(eventClass);
-    if (attribute.isEmpty()) {
-        *errorMessage = QStringLiteral("event class \"%1\" has no sub-events").arg(eventClass);
-        return false;
-    }
-    *element = QStringLiteral("<Event %1=\"%2\">%3</Event>")
-                   .arg(attribute, subEvent.toHtmlEscaped(), eventClass.toHtmlEscaped());
-    return true;
-}
-
-bool QueryArguments::eventGroup(const QString& group, QString* elements, QString* errorMessage)
-{
-    const QString name = group.trimmed().toLower();
-    if (name == QLatin1String("camera"))
-        *elements = CAMERA_TRIGGER_EVENT_FILTER_STRING;
-    else if (name == QLatin1String("system"))
-        *elements = SYSTEM_TRIGGER_EVENT_FILTER_STRING;
-    else if (name == QLatin1String("external"))
-        *elements = EXTERNAL_DEVICE_TRIGGER_EVENT_FILTER_STRING;
-    else {
-        *errorMessage =
-            QStringLiteral("unknown event group \"%1\" (expected camera, system or external)")
-                .arg(group);
-        return false;
-    }
-    return true;
+    QString stateList;
+    for (const QString& state : states)
+        stateList += QStringLiteral("<State>%1</State>").arg(state);
+    return QStringLiteral("<AlarmStateList>%1</AlarmStateList>").arg(stateList);
 }
 
 bool QueryArguments::build(const QueryFilter& filter, const QDateTime& now, QVariantMap* args,
@@ -108,13 +54,13 @@ bool QueryArguments::build(const QueryFilter& filter, const QDateTime& now, QVar
     QString events;
     for (const QString& group : filter.eventGroups) {
         QString elements;
-        if (!eventGroup(group, &elements, errorMessage))
+        if (!EventCatalog::groupFilter(group, &elements, errorMessage))
             return false;
         events += elements;
     }
     for (const QString& event : filter.events) {
         QString element;
-        if (!eventElement(event, &element, errorMessage))
+        if (!EventCatalog::element(event, &element, errorMessage))
             return false;
         events += element;
     }
@@ -137,10 +83,10 @@ bool QueryArguments::build(const QueryFilter& filter, const QDateTime& now, QVar
     QString startTime;
     QString endTime;
     if (!filter.from.isEmpty() && !TimeArgument::parse(filter.from, TimeArgument::Bound::Start, now,
-                                                       &startTime, errorMessage))
+                                                       filter.zone, &startTime, errorMessage))
         return false;
-    if (!filter.to.isEmpty() &&
-        !TimeArgument::parse(filter.to, TimeArgument::Bound::End, now, &endTime, errorMessage))
+    if (!filter.to.isEmpty() && !TimeArgument::parse(filter.to, TimeArgument::Bound::End, now,
+                                                     filter.zone, &endTime, errorMessage))
         return false;
     if (!startTime.isEmpty() && !endTime.isEmpty() && startTime > endTime) {
         *errorMessage = QStringLiteral("--from %1 is after --to %2").arg(startTime, endTime);
@@ -158,13 +104,8 @@ bool QueryArguments::build(const QueryFilter& filter, const QDateTime& now, QVar
     args->clear();
     if (!events.isEmpty())
         args->insert(ARG_TRIGGER_EVENT_FILTER, events);
-    if (!states.isEmpty()) {
-        QString stateList;
-        for (const QString& state : states)
-            stateList += QStringLiteral("<State>%1</State>").arg(state);
-        args->insert(ARG_STATE_FILTER,
-                     QStringLiteral("<AlarmStateList>%1</AlarmStateList>").arg(stateList));
-    }
+    if (!states.isEmpty())
+        args->insert(ARG_STATE_FILTER, stateFilter(states));
     if (!rules.isEmpty())
         args->insert(ARG_RULES, rules);
     if (!startTime.isEmpty())

@@ -3,6 +3,7 @@
 #include <QDateTime>
 #include <QString>
 #include <QStringList>
+#include <QTimeZone>
 #include <QVariantMap>
 
 // What a user asks for in an alarm search, in command-line terms.
@@ -16,6 +17,7 @@ struct QueryFilter
     QString to;
     QStringList names;
     QStringList devices;
+    QTimeZone zone = QTimeZone::utc(); // of times given without "Z" or an offset
 };
 
 // Turns command-line search terms into the argument map of the search requests.
@@ -30,8 +32,6 @@ public:
                       QString* errorMessage);
     // A state as the server spells it, from any letter case, with or without "-" or "_".
     static bool canonicalState(const QString& text, QString* state, QString* errorMessage);
-
-private:
-    static bool eventElement(const QString& event, QString* element, QString* errorMessage);
-    static bool eventGroup(const QString& group, QString* elements, QString* errorMessage);
+    // The state filter element for states already in the server's spelling.
+    static QString stateFilter(const QStringList& states);
 };

@@ -27,6 +27,8 @@ bool TcpTunnelClient::connectToServer(const QString& host, quint16 port, int tim
         m_connection,
         [&] { connected = m_connection->connectTo(host, port, timeoutMs, errorMessage); },
         Qt::BlockingQueuedConnection);
+    if (connected)
+        m_address = QStringLiteral("%1:%2").arg(host).arg(port);
     return connected;
 }
 
@@ -56,4 +58,11 @@ bool TcpTunnelClient::InsertRequest(const QString& /*pluginId*/, void* /*clientI
 bool TcpTunnelClient::waitForIdle(int timeoutMs)
 {
     return m_pendingWork.waitForIdle(timeoutMs);
+}
+
+QString TcpTunnelClient::connectionError() const
+{
+    if (m_connected || m_address.isEmpty())
+        return QString();
+    return QStringLiteral("connection to %1 lost").arg(m_address);
 }

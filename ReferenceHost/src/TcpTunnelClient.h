@@ -24,10 +24,12 @@ public:
     bool InsertRequest(const QString& pluginId, void* clientID, int requestKind,
                        const QString& method, InsertRequestInfo& info) override;
     bool waitForIdle(int timeoutMs) override;
+    QString connectionError() const override;
 
 private:
     PendingWork m_pendingWork;
     std::atomic<bool> m_connected{false};
+    QString m_address; // "host:port" once connected
     std::atomic<qint64> m_nextId{1};
     QThread m_thread;
     TcpTunnelConnection* m_connection;

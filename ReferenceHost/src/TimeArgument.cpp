@@ -1,7 +1,6 @@
 #include "TimeArgument.h"
 
 #include <QRegularExpression>
-#include <QTimeZone>
 
 namespace {
 
@@ -24,15 +23,60 @@ qint64 secondsPerUnit(QChar unit)
     return 0;
 }
 
+// "Z", "+01:00", "-0530" or "+01"; invalid for anything else.
+QTimeZone offsetZone(const QString& text)
+{
+    if (text.compare(QLatin1String("Z"), Qt::CaseInsensitive) == 0)
+        return QTimeZone::utc();
+    static const QRegularExpression offset(QStringLiteral("^([+-])(\\d{2}):?(\\d{2})?$"));
+    const QRegularExpressionMatch match = offset.match(text);
+    if (!match.hasMatch())
+        return QTimeZone();
+    const int hours = match.captured(2).toInt();
+    const int minutes = match.captured(3).toInt();
+    if (hours > 14 || minutes > 59)
+        return QTimeZone();
+    const int seconds = (hours * 3600 + minutes * 60) * (match.captured(1) == u"-" ? -1 : 1);
+    return QTimeZone(seconds);
+}
+
 } // namespace
+
+QString TimeArgument::acceptedForms()
+{
+    return QStringLiteral("expected ISO 8601 (2026-11-20T08:15:30Z, with an offset such as "
+                          "+01:00, fractional seconds allowed), \"2026-11-20 08:15[:30]\", a date "
+                          "2026-11-20, now, or an age such as 30m, 24h, 7d or 2w");
+}
 
 QString TimeArgument::toServerTime(const QDateTime& time)
 {
     return time.toUTC().toString(kServerFormat);
 }
 
+QString TimeArgument::display(const QString& serverTime, const QTimeZone& zone)
+{
+    if (!zone.isValid() || zone == QTimeZone::utc())
+        return serverTime;
+    const QDateTime time = QDateTime::fromString(serverTime, Qt::ISODate);
+    if (!time.isValid())
+        return serverTime;
+    return time.toTimeZone(zone).toString(Qt::ISODate);
+}
+
+QTimeZone TimeArgument::zoneNamed(const QString& name)
+{
+    const QString trimmed = name.trimmed();
+    if (trimmed.compare(QLatin1String("UTC"), Qt::CaseInsensitive) == 0)
+        return QTimeZone::utc();
+    const QTimeZone offset = offsetZone(trimmed);
+    if (offset.isValid())
+        return offset;
+    return QTimeZone(trimmed.toUtf8());
+}
+
 bool TimeArgument::parse(const QString& text, Bound bound, const QDateTime& now,
-                         QString* serverTime, QString* errorMessage)
+                         const QTimeZone& zone, QString* serverTime, QString* errorMessage)
 {
     const QString input = text.trimmed();
     if (input.compare(QLatin1String("now"), Qt::CaseInsensitive) == 0) {
@@ -49,22 +93,28 @@ bool TimeArgument::parse(const QString& text, Bound bound, const QDateTime& now,
         return true;
     }
 
-    QString withoutZone = input;
-    if (withoutZone.endsWith(QLatin1Char('Z')))
-        withoutZone.chop(1);
-    QDateTime time = QDateTime::fromString(withoutZone, kServerFormat);
-    if (!time.isValid()) {
-        const QDate date = QDate::fromString(input, QStringLiteral("yyyy-MM-dd"));
-        if (date.isValid())
-            time = QDateTime(date, bound == Bound::Start ? QTime(0, 0, 0) : QTime(23, 59, 59));
+    static const QRegularExpression form(QStringLiteral(
+        "^(\\d{4}-\\d{2}-\\d{2})(?:[Tt ](\\d{2}):(\\d{2})(?::(\\d{2})(?:[.,]\\d{1,9})?)?"
+        "\\s*([Zz]|[+-]\\d{2}(?::?\\d{2})?)?)?$"));
+    const QRegularExpressionMatch match = form.match(input);
+    const QDate date = QDate::fromString(match.captured(1), QStringLiteral("yyyy-MM-dd"));
+    QTimeZone timeZone = zone;
+    if (match.hasMatch() && !match.captured(5).isEmpty())
+        timeZone = offsetZone(match.captured(5));
+    QTime time;
+    if (match.captured(2).isEmpty()) {
+        time = bound == Bound::Start ? QTime(0, 0, 0) : QTime(23, 59, 59);
+    } else {
+        const bool withSeconds = !match.captured(4).isEmpty();
+        time = QTime(match.captured(2).toInt(), match.captured(3).toInt(),
+                     withSeconds ? match.captured(4).toInt() : (bound == Bound::End ? 59 : 0));
     }
-    if (!time.isValid()) {
-        *errorMessage = QStringLiteral("bad time \"%1\": expected yyyy-MM-ddTHH:mm:ss, "
-                                       "yyyy-MM-dd, now, or an age like 24h or 7d")
-                            .arg(text);
+    const QDateTime dateTime(date, time, timeZone);
+    if (!match.hasMatch() || !date.isValid() || !time.isValid() || !timeZone.isValid() ||
+        !dateTime.isValid()) {
+        *errorMessage = QStringLiteral("bad time \"%1\": %2").arg(text, acceptedForms());
         return false;
     }
-    time.setTimeZone(QTimeZone::utc());
-    *serverTime = toServerTime(time);
+    *serverTime = toServerTime(dateTime);
     return true;
 }
