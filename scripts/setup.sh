@@ -5,7 +5,7 @@ set -euo pipefail
 
 packages=(
     cmake ninja-build g++ pkg-config
-    qt6-base-dev libqt6sql6-sqlite
+    qt6-base-dev libqt6sql6-sqlite qt6-httpserver-dev qt6-websockets-dev
     libpugixml-dev libbenchmark-dev
     clang-14 libclang-rt-14-dev
 )

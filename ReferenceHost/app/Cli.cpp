@@ -40,7 +40,17 @@ Cli::Cli()
       m_timeoutOption(
           QStringLiteral("timeout"),
           QStringLiteral("Seconds to wait for an answer (default %1).").arg(kDefaultTimeoutSeconds),
-          QStringLiteral("seconds"))
+          QStringLiteral("seconds")),
+      m_hostOption(QStringLiteral("host"),
+                   QStringLiteral("Talk to a running 'alarmsearch serve' at this URL instead of "
+                                  "loading the plug-in (default: $ALARMSEARCH_HOST); its token "
+                                  "comes from $ALARMSEARCH_TOKEN."),
+                   QStringLiteral("url")),
+      m_userOption(QStringLiteral("user"),
+                   QStringLiteral("Operator recorded in the history of the changes made (default "
+                                  "\"%1\"; with --host the token's user).")
+                       .arg(AlarmServerSim::AlarmServer::kDefaultOperator),
+                   QStringLiteral("name"))
 {
 }
 
@@ -60,7 +70,8 @@ QString Cli::printHelp() const
     help += QStringLiteral("\nGlobal options (also accepted after the command):\n");
     QCommandLineParser parser;
     parser.addOptions({m_pluginOption, m_serverOption, m_dbOption, m_memoryOption,
-                       m_seedCountOption, m_prettyOption, m_xmlOption, m_timeoutOption});
+                       m_seedCountOption, m_prettyOption, m_xmlOption, m_timeoutOption,
+                       m_hostOption, m_userOption});
     parser.addHelpOption();
     parser.addVersionOption();
     const QString options = parser.helpText();
@@ -72,7 +83,8 @@ QString Cli::printHelp() const
 int Cli::run(const QStringList& arguments)
 {
     m_globalParser.addOptions({m_pluginOption, m_serverOption, m_dbOption, m_memoryOption,
-                               m_seedCountOption, m_prettyOption, m_xmlOption, m_timeoutOption});
+                               m_seedCountOption, m_prettyOption, m_xmlOption, m_timeoutOption,
+                               m_hostOption, m_userOption});
     const QCommandLineOption helpOption = m_globalParser.addHelpOption();
     const QCommandLineOption versionOption = m_globalParser.addVersionOption();
     m_globalParser.setOptionsAfterPositionalArgumentsMode(
@@ -108,7 +120,8 @@ int Cli::run(const QStringList& arguments)
 bool Cli::parseCommand(QCommandLineParser& parser, const QStringList& arguments, int* exitCode)
 {
     parser.addOptions({m_pluginOption, m_serverOption, m_dbOption, m_memoryOption,
-                       m_seedCountOption, m_prettyOption, m_xmlOption, m_timeoutOption});
+                       m_seedCountOption, m_prettyOption, m_xmlOption, m_timeoutOption,
+                       m_hostOption, m_userOption});
     const QCommandLineOption helpOption = parser.addHelpOption();
     if (!parser.parse(arguments)) {
         *exitCode = usageError(parser.errorText());
@@ -149,8 +162,51 @@ int Cli::timeoutMs() const
     return (seconds > 0 ? seconds : kDefaultTimeoutSeconds) * 1000;
 }
 
+QString Cli::remoteHost() const
+{
+    return isSet(m_hostOption) ? value(m_hostOption) : qEnvironmentVariable("ALARMSEARCH_HOST");
+}
+
+ClientSession& Cli::session()
+{
+    if (m_remote)
+        return *m_remote;
+    return m_host->session();
+}
+
+bool Cli::openRemote(int* exitCode)
+{
+    for (const QCommandLineOption* local : {&m_pluginOption, &m_serverOption, &m_dbOption,
+                                            &m_memoryOption, &m_seedCountOption, &m_userOption}) {
+        if (isSet(*local)) {
+            *exitCode = usageError(QStringLiteral("--%1 is for a host in this process; with "
+                                                  "--host the server decides it")
+                                       .arg(local->names().constFirst()));
+            return false;
+        }
+    }
+    const QUrl url(remoteHost(), QUrl::StrictMode);
+    if (!url.isValid() || url.scheme() != QLatin1String("http") || url.host().isEmpty()) {
+        *exitCode =
+            usageError(QStringLiteral("--host needs a URL like http://127.0.0.1:47880, not \"%1\"")
+                           .arg(remoteHost()));
+        return false;
+    }
+    m_remote =
+        std::make_unique<RemoteSession>(url, qEnvironmentVariable("ALARMSEARCH_TOKEN"), keepXml());
+    QString error;
+    if (!m_remote->connectToServer(timeoutMs(), &error)) {
+        m_remote.reset();
+        *exitCode = fail(error);
+        return false;
+    }
+    return true;
+}
+
 bool Cli::openHost(int* exitCode)
 {
+    if (isRemote())
+        return openRemote(exitCode);
     ReferenceHost::Options options;
     options.pluginPath = pluginPath();
     options.serverAddress = value(m_serverOption);
@@ -186,8 +242,23 @@ bool Cli::openHost(int* exitCode)
     return openHost(options, exitCode);
 }
 
-bool Cli::openHost(const ReferenceHost::Options& options, int* exitCode)
+bool Cli::openHost(const ReferenceHost::Options& hostOptions, int* exitCode)
 {
+    if (isRemote()) {
+        *exitCode =
+            usageError(QStringLiteral("%1 runs its own host; it takes no --host").arg(m_command));
+        return false;
+    }
+    ReferenceHost::Options options = hostOptions;
+    if (isSet(m_userOption)) {
+        options.operatorName = value(m_userOption).trimmed();
+        if (options.operatorName.isEmpty() ||
+            options.operatorName.size() > AlarmServerSim::AlarmServer::kMaxOperatorName) {
+            *exitCode = usageError(QStringLiteral("--user needs a name of 1 to %1 characters")
+                                       .arg(AlarmServerSim::AlarmServer::kMaxOperatorName));
+            return false;
+        }
+    }
     m_host = std::make_unique<ReferenceHost>();
     QString error;
     if (!m_host->open(options, &error)) {
@@ -202,7 +273,7 @@ bool Cli::call(const QString& method, const QVariant& args, QList<PluginAnswer>*
                int* exitCode)
 {
     QString error;
-    if (m_host->session().call(method, args, timeoutMs(), answers, &error))
+    if (session().call(method, args, timeoutMs(), answers, &error))
         return true;
     *exitCode = fail(error);
     return false;

@@ -31,5 +31,6 @@ int unmute(Cli& cli, const QStringList& arguments);
 int events(Cli& cli, const QStringList& arguments);
 int batch(Cli& cli, const QStringList& arguments);
 int demo(Cli& cli, const QStringList& arguments);
+int serve(Cli& cli, const QStringList& arguments);
 
 } // namespace Commands
