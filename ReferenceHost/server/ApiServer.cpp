@@ -87,6 +87,23 @@ QJsonObject answerHead(const QString& method, const QString& resultCode)
             {QStringLiteral("resultCode"), resultCode}};
 }
 
+QByteArray upgradeRequired()
+{
+    return QJsonDocument(QJsonObject{{QStringLiteral("error"), QStringLiteral("upgrade required")},
+                                     {QStringLiteral("problem"),
+                                      QStringLiteral("open a WebSocket on this path")}})
+        .toJson(QJsonDocument::Compact);
+}
+
+QByteArray authorization(const QHttpServerRequest& request)
+{
+#if QT_VERSION >= QT_VERSION_CHECK(6, 8, 0)
+    return request.headers().value(QHttpHeaders::WellKnownHeader::Authorization).toByteArray();
+#else
+    return request.value(QByteArrayLiteral("authorization"));
+#endif
+}
+
 QHttpServerResponse toResponse(const Reply& reply)
 {
     const QByteArray bytes =
@@ -178,8 +195,8 @@ void ApiServer::addRoutes()
                                                     : QHttpServerRequest::Method::Post;
         const auto dispatch = [this, route](const QHttpServerRequest& request,
                                             const QString& alarmId) {
-            Call call{request.url().path(), alarmId, request.body(),
-                      request.value(QByteArrayLiteral("authorization")), QElapsedTimer()};
+            Call call{request.url().path(), alarmId, request.body(), authorization(request),
+                      QElapsedTimer()};
             call.started.start();
             return QtConcurrent::run(&m_pool, [this, route, call] {
                 const Reply reply = handle(route, call);
@@ -191,6 +208,22 @@ void ApiServer::addRoutes()
             });
         };
         QString pattern = route.path;
+#if QT_VERSION < QT_VERSION_CHECK(6, 8, 0)
+        if (route.path == ApiRoutes::kEventsPath) {
+            // Qt HTTP Server 6.4 hands a WebSocket upgrade request to the routes too, after it
+            // upgraded the socket, which must then get no HTTP answer.
+            m_http->route(pattern, verb,
+                          [](const QHttpServerRequest& request, QHttpServerResponder&& responder) {
+                              if (request.value(QByteArrayLiteral("upgrade")).toLower() ==
+                                  "websocket")
+                                  return;
+                              qCInfo(lcServe).noquote() << "GET" << request.url().path() << 426;
+                              responder.write(upgradeRequired(), "application/json",
+                                              QHttpServerResponder::StatusCode(426));
+                          });
+            continue;
+        }
+#endif
         if (pattern.contains(QLatin1String("{alarmId}"))) {
             pattern.replace(QLatin1String("{alarmId}"), QLatin1String("<arg>"));
             m_http->route(pattern, verb, [dispatch](QString alarmId, const QHttpServerRequest& r) {
@@ -299,9 +332,7 @@ ApiServer::Reply ApiServer::handle(const ApiRoutes::Route& route, const Call& ca
 
     Reply reply;
     if (route.path == ApiRoutes::kEventsPath)
-        reply = json(
-            426, {{QStringLiteral("error"), QStringLiteral("upgrade required")},
-                  {QStringLiteral("problem"), QStringLiteral("open a WebSocket on this path")}});
+        reply = Reply{426, QJsonObject(), QString(), upgradeRequired()};
     else if (route.operationId == QLatin1String("getMe"))
         reply = json(200, {{QStringLiteral("user"), user}});
     else if (route.method == METHOD_QUERY_ALARM_LIST ||
