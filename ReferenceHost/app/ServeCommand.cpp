@@ -8,6 +8,8 @@
 
 #include <csignal>
 
+#include <sys/resource.h>
+
 namespace {
 
 volatile std::sig_atomic_t g_stopRequested = 0;
@@ -15,6 +17,17 @@ volatile std::sig_atomic_t g_stopRequested = 0;
 extern "C" void onStopSignal(int)
 {
     g_stopRequested = 1;
+}
+
+// Every client holds a socket, and a WebSocket subscriber stays: the soft limit of open files
+// (often 1024) is raised to the hard one.
+void raiseOpenFileLimit()
+{
+    rlimit limit{};
+    if (getrlimit(RLIMIT_NOFILE, &limit) == 0 && limit.rlim_cur < limit.rlim_max) {
+        limit.rlim_cur = limit.rlim_max;
+        setrlimit(RLIMIT_NOFILE, &limit);
+    }
 }
 
 bool readListen(const QString& text, ApiServer::Options* options)
@@ -72,6 +85,7 @@ int serve(Cli& cli, const QStringList& arguments)
     options.timeoutMs = cli.timeoutMs();
     if (cli.isRemote())
         return cli.usageError(QStringLiteral("serve is the server; it takes no --host"));
+    raiseOpenFileLimit();
     if (!cli.openHost(&exitCode))
         return exitCode;
 

@@ -294,7 +294,11 @@ void ApiServer::acceptEventSockets()
         const QString origin = socket->origin();
         qCInfo(lcServe).noquote() << "WS" << path << key << "origin"
                                   << (origin.isEmpty() ? QStringLiteral("-") : origin);
-        if (path != ApiRoutes::kEventsPath)
+        ++m_openEventSockets;
+        connect(events, &QObject::destroyed, this, [this] { --m_openEventSockets; });
+        if (m_openEventSockets > EventSocket::kMaxSockets)
+            events->refuse(EventSocket::TooMany, QStringLiteral("too many subscribers"));
+        else if (path != ApiRoutes::kEventsPath)
             events->refuse(EventSocket::UnknownPath, QStringLiteral("unknown path"));
         else if (!originAllowed(origin))
             events->refuse(EventSocket::OriginRefused, QStringLiteral("origin not allowed"));

@@ -70,6 +70,7 @@ private:
     QThreadPool m_pool;
     std::atomic<qint64> m_nextRelay{1};
     qint64 m_nextSocket = 1;
+    int m_openEventSockets = 0;
     QString m_outcomeKey;
     QMutex m_outcomeMutex;
     QHash<QString, QJsonObject> m_outcomes; // event of an update in flight, by relay path
