@@ -85,12 +85,14 @@ int serve(Cli& cli, const QStringList& arguments)
     options.timeoutMs = cli.timeoutMs();
     if (cli.isRemote())
         return cli.usageError(QStringLiteral("serve is the server; it takes no --host"));
+    QString error;
+    if (!ApiServer::checkAddress(options, &error))
+        return cli.fail(error);
     raiseOpenFileLimit();
     if (!cli.openHost(&exitCode))
         return exitCode;
 
     ApiServer server(cli.host());
-    QString error;
     if (!server.listen(options, &error))
         return cli.fail(error);
     cli.printOut(QStringLiteral("listening on %1\n").arg(server.url().toString()).toUtf8());

@@ -127,17 +127,24 @@ ApiServer::~ApiServer()
     stop();
 }
 
-bool ApiServer::listen(const Options& options, QString* errorMessage)
+bool ApiServer::checkAddress(const Options& options, QString* errorMessage)
 {
-    m_options = options;
-    if (!options.usersFile.isEmpty() && !m_users.load(options.usersFile, errorMessage))
-        return false;
-    if (m_users.isEmpty() && !options.address.isLoopback()) {
+    if (options.usersFile.isEmpty() && !options.address.isLoopback()) {
         *errorMessage = QStringLiteral("%1 is not a loopback address: give a users file "
                                        "(--users) so that operators are known by their tokens")
                             .arg(options.address.toString());
         return false;
     }
+    return true;
+}
+
+bool ApiServer::listen(const Options& options, QString* errorMessage)
+{
+    m_options = options;
+    if (!options.usersFile.isEmpty() && !m_users.load(options.usersFile, errorMessage))
+        return false;
+    if (!checkAddress(options, errorMessage))
+        return false;
     addRoutes();
     m_tcpServer = new GuardedTcpServer(ApiRequest::kMaxBodyBytes);
     if (!m_tcpServer->listen(options.address, options.port)) {

@@ -42,7 +42,8 @@ public:
     explicit ApiServer(ReferenceHost& host, QObject* parent = nullptr);
     ~ApiServer() override;
 
-    // Refuses a non-loopback address without a users file.
+    // Refuses a non-loopback address without a users file, before anything is started.
+    static bool checkAddress(const Options& options, QString* errorMessage);
     bool listen(const Options& options, QString* errorMessage);
     QUrl url() const;
     // Stops taking connections, closes the event sockets and waits for the requests in flight.
