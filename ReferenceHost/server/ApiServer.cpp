@@ -185,13 +185,15 @@ void ApiServer::stop()
     qDeleteAll(findChildren<EventSocket*>());
     m_host.session().unsubscribe(m_outcomeKey);
     m_pool.waitForDone();
-    // Hands the last answers to their sockets.
-    QCoreApplication::processEvents();
-    // Event deliveries still running on reply threads post to this object.
-    m_host.tunnelClient().waitForIdle(m_options.timeoutMs);
+    // Hands the last answers to their sockets, then closes the connections; a request read
+    // meanwhile is still carried out.
     QCoreApplication::processEvents();
     m_tcpServer = nullptr;
     m_http.reset();
+    m_pool.waitForDone();
+    // Event deliveries still running on reply threads post to this object.
+    m_host.tunnelClient().waitForIdle(m_options.timeoutMs);
+    QCoreApplication::processEvents();
 }
 
 void ApiServer::addRoutes()
