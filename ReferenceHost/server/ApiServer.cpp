@@ -155,7 +155,7 @@ bool ApiServer::listen(const Options& options, QString* errorMessage)
         m_tcpServer = nullptr;
         return false;
     }
-    m_http->bind(m_tcpServer);
+    static_cast<void>(m_http->bind(m_tcpServer)); // void before Qt 6.8, bool after
     m_tcpServer->followHttpServer();
 
     m_outcomeKey = QStringLiteral("serve-outcomes-%1").arg(QCoreApplication::applicationPid());
