@@ -6,7 +6,7 @@ set -euo pipefail
 
 packages=(
     cmake ninja-build g++ pkg-config time
-    qt6-base-dev libqt6sql6-sqlite libutf8proc-dev
+    qt6-base-dev libqt6sql6-sqlite qt6-httpserver-dev qt6-websockets-dev libutf8proc-dev
     libbenchmark-dev
     clang-14 libclang-rt-14-dev
     help2man dpkg-dev lintian

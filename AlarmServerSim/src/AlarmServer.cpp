@@ -27,8 +27,6 @@ const QString kStatusUnknownAlarm = QStringLiteral("80000004");
 const QString kResultOk = QStringLiteral("0");
 const QString kResultUnknownAlarm = QStringLiteral("1");
 
-const QString kProcessingUser = QStringLiteral("operator");
-
 // Schema version kept in the database's user_version; 0 means a new database.
 constexpr int kSchemaVersion = 1;
 
@@ -102,14 +100,15 @@ CommandReply serverError(const QSqlQuery& query)
 
 struct AlarmServer::Private
 {
-    using CommandHandler = CommandReply (Private::*)(QSqlDatabase, const XmlElement&);
+    using CommandHandler = CommandReply (Private::*)(QSqlDatabase, const XmlElement&,
+                                                     const QString& user);
 
     bool createAndSeed(const Options& options, QString* errorMessage);
 
-    CommandReply queryAlarmList(QSqlDatabase db, const XmlElement& command);
-    CommandReply processAlarm(QSqlDatabase db, const XmlElement& command);
-    CommandReply getAlarmInfo(QSqlDatabase db, const XmlElement& command);
-    CommandReply muteAlarm(QSqlDatabase db, const XmlElement& command);
+    CommandReply queryAlarmList(QSqlDatabase db, const XmlElement& command, const QString&);
+    CommandReply processAlarm(QSqlDatabase db, const XmlElement& command, const QString& user);
+    CommandReply getAlarmInfo(QSqlDatabase db, const XmlElement& command, const QString&);
+    CommandReply muteAlarm(QSqlDatabase db, const XmlElement& command, const QString&);
 
     ConnectionPool connections;
     // Commands that read share the database; a command that writes has it alone.
@@ -171,7 +170,10 @@ bool AlarmServer::Private::createAndSeed(const Options& options, QString* errorM
     return false;
 }
 
-CommandReply AlarmServer::execute(const QString& method, const QString& commandText)
+const QString AlarmServer::kDefaultOperator = QStringLiteral("operator");
+
+CommandReply AlarmServer::execute(const QString& method, const QString& commandText,
+                                  const QString& operatorName)
 {
     static const QHash<QString, Private::CommandHandler> handlers = {
         {QStringLiteral("QryAlarmList"), &Private::queryAlarmList},
@@ -192,10 +194,14 @@ CommandReply AlarmServer::execute(const QString& method, const QString& commandT
         qWarning("alarm server: cannot open the database: %s", qPrintable(error));
         return {kStatusServerError, QString()};
     }
-    return (d.get()->*handler)(db, *command);
+    const QString user = operatorName.isEmpty() || operatorName.size() > kMaxOperatorName
+                             ? kDefaultOperator
+                             : operatorName;
+    return (d.get()->*handler)(db, *command, user);
 }
 
-CommandReply AlarmServer::Private::queryAlarmList(QSqlDatabase db, const XmlElement& command)
+CommandReply AlarmServer::Private::queryAlarmList(QSqlDatabase db, const XmlElement& command,
+                                                  const QString& /*user*/)
 {
     const std::optional<AlarmFilter> filter = alarmFilterFromCommand(command);
     if (!filter)
@@ -221,7 +227,8 @@ CommandReply AlarmServer::Private::queryAlarmList(QSqlDatabase db, const XmlElem
     return ok(reply);
 }
 
-CommandReply AlarmServer::Private::processAlarm(QSqlDatabase db, const XmlElement& command)
+CommandReply AlarmServer::Private::processAlarm(QSqlDatabase db, const XmlElement& command,
+                                                const QString& user)
 {
     QVariant state; // null: keep the alarm's state
     if (const XmlElement* status = command.child(u"Status")) {
@@ -260,7 +267,7 @@ CommandReply AlarmServer::Private::processAlarm(QSqlDatabase db, const XmlElemen
             found = update.numRowsAffected() > 0;
         }
         if (found) {
-            if (!execWith(log, {now, note, kProcessingUser, *number})) {
+            if (!execWith(log, {now, note, user, *number})) {
                 db.rollback();
                 return serverError(log);
             }
@@ -276,7 +283,8 @@ CommandReply AlarmServer::Private::processAlarm(QSqlDatabase db, const XmlElemen
     return ok(reply);
 }
 
-CommandReply AlarmServer::Private::getAlarmInfo(QSqlDatabase, const XmlElement& command)
+CommandReply AlarmServer::Private::getAlarmInfo(QSqlDatabase, const XmlElement& command,
+                                                const QString& /*user*/)
 {
     const CommandReply unknownAlarm{kStatusUnknownAlarm, QString()};
     const std::optional<qint64> number = parseAlarmId(command.childText(u"AlarmID"));
@@ -324,7 +332,8 @@ CommandReply AlarmServer::Private::getAlarmInfo(QSqlDatabase, const XmlElement& 
     return ok(reply);
 }
 
-CommandReply AlarmServer::Private::muteAlarm(QSqlDatabase db, const XmlElement& command)
+CommandReply AlarmServer::Private::muteAlarm(QSqlDatabase db, const XmlElement& command,
+                                             const QString& /*user*/)
 {
     const QString muteText = command.childText(u"Mute");
     if (muteText != QLatin1String("true") && muteText != QLatin1String("false"))

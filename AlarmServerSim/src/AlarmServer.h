@@ -34,8 +34,14 @@ public:
 
     // Opens the database, creating the schema and seeding demo alarms when it is new.
     bool open(const Options& options, QString* errorMessage);
-    // Runs one command; may be called from any thread, also concurrently.
-    CommandReply execute(const QString& method, const QString& commandText);
+    // Runs one command; may be called from any thread, also concurrently. operatorName is who
+    // asked, as the host knows its client; a change is logged under it (empty, or longer than
+    // kMaxOperatorName: kDefaultOperator).
+    CommandReply execute(const QString& method, const QString& commandText,
+                         const QString& operatorName = QString());
+
+    static constexpr int kMaxOperatorName = 64;
+    static const QString kDefaultOperator;
 
     // The per-user database file used when no other is chosen.
     static QString defaultDatabasePath();

@@ -56,6 +56,7 @@ private:
         const QJsonValue id = request.value(QLatin1String("id"));
         const QJsonValue method = request.value(QLatin1String("method"));
         const QJsonValue command = request.value(QLatin1String("command"));
+        const QString operatorName = request.value(QLatin1String("operator")).toString();
         if (!method.isString() || !command.isString()) {
             finish(sequence, {{QLatin1String("id"), id},
                               {QLatin1String("status"), kStatusBadRequest},
@@ -64,8 +65,8 @@ private:
         }
         AlarmServer& server = m_server;
         m_pool.start([this, &server, sequence, id, method = method.toString(),
-                      command = command.toString()] {
-            const CommandReply reply = server.execute(method, command);
+                      command = command.toString(), operatorName] {
+            const CommandReply reply = server.execute(method, command, operatorName);
             QJsonObject payload;
             if (method != kMuteMethod)
                 payload = {{QLatin1String("id"), id},

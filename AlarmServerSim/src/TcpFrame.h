@@ -9,7 +9,8 @@
 namespace AlarmServerSim {
 
 // One frame = 4-byte big-endian payload length + UTF-8 JSON object payload.
-// Request payload: {"id": <number>, "method": "QryAlarmList", "command": "<xml>"}
+// Request payload: {"id": <number>, "method": "QryAlarmList", "command": "<xml>",
+//                   "operator": "alice"} (the operator is optional: who made a change)
 // Reply payload:   {"id": <number>, "status": "0", "reply": "<xml>"} (none for "MuteAlarm")
 constexpr quint32 kMaxFramePayload = 64 * 1024 * 1024;
 

@@ -89,7 +89,7 @@ int sendMute(Cli& cli, const QStringList& arguments, bool isMute)
     cli.session().send(METHOD_MUTE_ALARM, QVariantMap{{ARG_ALARM_ID_LIST, ids},
                                                       {ARG_IS_MUTE, isMute},
                                                       {ARG_MUTE_TIME_SECOND, seconds}});
-    if (!cli.host().tunnelClient().waitForIdle(cli.timeoutMs()))
+    if (!cli.session().waitForIdle(cli.timeoutMs()))
         return cli.fail(QStringLiteral("the mute request was not delivered in time"));
     cli.printNote(
         isMute

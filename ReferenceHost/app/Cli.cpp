@@ -67,15 +67,25 @@ Cli::Cli()
                                 "or an offset such as +02:00 (default UTC)."),
                  QStringLiteral("zone")),
       m_localOption(QStringLiteral("local"),
-                    QStringLiteral("Use this machine's time zone, as --tz does."))
+                    QStringLiteral("Use this machine's time zone, as --tz does.")),
+      m_hostOption(QStringLiteral("host"),
+                   QStringLiteral("Talk to a running 'alarmsearch serve' at this URL instead of "
+                                  "loading the plug-in (default: $ALARMSEARCH_HOST); its token "
+                                  "comes from $ALARMSEARCH_TOKEN."),
+                   QStringLiteral("url")),
+      m_userOption(QStringLiteral("user"),
+                   QStringLiteral("Operator recorded in the history of the changes made (default "
+                                  "\"%1\"; with --host the token's user).")
+                       .arg(AlarmServerSim::AlarmServer::kDefaultOperator),
+                   QStringLiteral("name"))
 {
 }
 
 QList<QCommandLineOption> Cli::globalOptions() const
 {
-    return {m_pluginOption,    m_serverOption, m_dbOption,   m_memoryOption,
-            m_seedCountOption, m_prettyOption, m_xmlOption,  m_timeoutOption,
-            m_verboseOption,   m_tzOption,     m_localOption};
+    return {m_pluginOption, m_serverOption, m_dbOption,      m_memoryOption,  m_seedCountOption,
+            m_prettyOption, m_xmlOption,    m_timeoutOption, m_verboseOption, m_tzOption,
+            m_localOption,  m_hostOption,   m_userOption};
 }
 
 Cli::~Cli() = default;
@@ -218,8 +228,51 @@ bool Cli::embeddedServerDefault() const
            !isSet(m_seedCountOption);
 }
 
+QString Cli::remoteHost() const
+{
+    return isSet(m_hostOption) ? value(m_hostOption) : qEnvironmentVariable("ALARMSEARCH_HOST");
+}
+
+ClientSession& Cli::session()
+{
+    if (m_remote)
+        return *m_remote;
+    return m_host->session();
+}
+
+bool Cli::openRemote(int* exitCode)
+{
+    for (const QCommandLineOption* local : {&m_pluginOption, &m_serverOption, &m_dbOption,
+                                            &m_memoryOption, &m_seedCountOption, &m_userOption}) {
+        if (isSet(*local)) {
+            *exitCode = usageError(QStringLiteral("--%1 is for a host in this process; with "
+                                                  "--host the server decides it")
+                                       .arg(local->names().constFirst()));
+            return false;
+        }
+    }
+    const QUrl url(remoteHost(), QUrl::StrictMode);
+    if (!url.isValid() || url.scheme() != QLatin1String("http") || url.host().isEmpty()) {
+        *exitCode =
+            usageError(QStringLiteral("--host needs a URL like http://127.0.0.1:47880, not \"%1\"")
+                           .arg(remoteHost()));
+        return false;
+    }
+    m_remote =
+        std::make_unique<RemoteSession>(url, qEnvironmentVariable("ALARMSEARCH_TOKEN"), keepXml());
+    QString error;
+    if (!m_remote->connectToServer(timeoutMs(), &error)) {
+        m_remote.reset();
+        *exitCode = fail(error);
+        return false;
+    }
+    return true;
+}
+
 bool Cli::openHost(int* exitCode)
 {
+    if (isRemote())
+        return openRemote(exitCode);
     ReferenceHost::Options options;
     options.pluginPath = pluginPath();
     options.serverAddress = value(m_serverOption);
@@ -263,8 +316,23 @@ bool Cli::openHost(int* exitCode)
     return true;
 }
 
-bool Cli::openHost(const ReferenceHost::Options& options, int* exitCode)
+bool Cli::openHost(const ReferenceHost::Options& hostOptions, int* exitCode)
 {
+    if (isRemote()) {
+        *exitCode =
+            usageError(QStringLiteral("%1 runs its own host; it takes no --host").arg(m_command));
+        return false;
+    }
+    ReferenceHost::Options options = hostOptions;
+    if (isSet(m_userOption)) {
+        options.operatorName = value(m_userOption).trimmed();
+        if (options.operatorName.isEmpty() ||
+            options.operatorName.size() > AlarmServerSim::AlarmServer::kMaxOperatorName) {
+            *exitCode = usageError(QStringLiteral("--user needs a name of 1 to %1 characters")
+                                       .arg(AlarmServerSim::AlarmServer::kMaxOperatorName));
+            return false;
+        }
+    }
     // The trace library reads its settings when the plug-in loads it.
     if (!isSet(m_verboseOption) && !qEnvironmentVariableIsSet("ZOLTLOG_FILE"))
         qputenv("ZOLTLOG_LEVEL", "0");
@@ -282,7 +350,7 @@ bool Cli::call(const QString& method, const QVariant& args, QList<PluginAnswer>*
                int* exitCode)
 {
     QString error;
-    if (m_host->session().call(method, args, timeoutMs(), answers, &error))
+    if (session().call(method, args, timeoutMs(), answers, &error))
         return true;
     *exitCode = fail(error);
     return false;

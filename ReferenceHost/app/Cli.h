@@ -3,6 +3,7 @@
 #include <HostSession.h>
 #include <QueryArguments.h>
 #include <ReferenceHost.h>
+#include <RemoteSession.h>
 
 #include <QCommandLineOption>
 #include <QCommandLineParser>
@@ -26,14 +27,18 @@ public:
     // Adds the global options to a command's parser and parses the command's arguments. False
     // when the command is done already (--help, or a usage error); exitCode tells how.
     bool parseCommand(QCommandLineParser& parser, const QStringList& arguments, int* exitCode);
-    // Opens the host as the global options say: the plug-in file, the server or database.
+    // Opens the host as the global options say: the plug-in file, the server or database; or,
+    // with --host, a session with a running `alarmsearch serve`.
     bool openHost(int* exitCode);
     bool openHost(const ReferenceHost::Options& options, int* exitCode);
     // Whether the command line leaves the server alone: no --server, --db, --memory or
     // --seed-count.
     bool embeddedServerDefault() const;
-    HostSession& session() { return m_host->session(); }
+    ClientSession& session();
+    // The host in this process (not with --host).
     ReferenceHost& host() { return *m_host; }
+    // Whether --host (or $ALARMSEARCH_HOST) names a running server to talk to.
+    bool isRemote() const { return !remoteHost().isEmpty(); }
 
     // Sends a request and waits for its answers; on timeout reports it and sets exitCode.
     bool call(const QString& method, const QVariant& args, QList<PluginAnswer>* answers,
@@ -67,6 +72,8 @@ private:
     QString printHelp() const;
     QList<QCommandLineOption> globalOptions() const;
     bool readTimeZone(int* exitCode);
+    QString remoteHost() const;
+    bool openRemote(int* exitCode);
     bool isSet(const QCommandLineOption& option) const;
     QString value(const QCommandLineOption& option) const;
 
@@ -81,10 +88,13 @@ private:
     QCommandLineOption m_verboseOption;
     QCommandLineOption m_tzOption;
     QCommandLineOption m_localOption;
+    QCommandLineOption m_hostOption;
+    QCommandLineOption m_userOption;
     QCommandLineParser m_globalParser;
     const QCommandLineParser* m_commandParser = nullptr;
     QString m_command;
     QTimeZone m_timeZone = QTimeZone::utc();
     QMutex m_outputMutex;
     std::unique_ptr<ReferenceHost> m_host;
+    std::unique_ptr<RemoteSession> m_remote;
 };

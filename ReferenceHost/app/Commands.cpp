@@ -18,6 +18,8 @@ const QList<Command>& all()
          QStringLiteral("Export found alarms with their history as CSV or JSON"), exportAlarms},
         {QStringLiteral("batch"), QStringLiteral("Answer JSON-line requests from standard input"),
          batch},
+        {QStringLiteral("serve"),
+         QStringLiteral("Serve the plug-in to many operators over HTTP and WebSocket"), serve},
         {QStringLiteral("demo"),
          QStringLiteral("Walk through every request against a fresh embedded server"), demo},
     };

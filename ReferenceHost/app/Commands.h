@@ -32,5 +32,6 @@ int events(Cli& cli, const QStringList& arguments);
 int batch(Cli& cli, const QStringList& arguments);
 int demo(Cli& cli, const QStringList& arguments);
 int classes(Cli& cli, const QStringList& arguments);
+int serve(Cli& cli, const QStringList& arguments);
 
 } // namespace Commands

@@ -91,7 +91,6 @@ int DemoScript::run()
     options.embedded.databasePath = QStringLiteral(":memory:");
     options.embedded.seedCount = kDemoAlarms;
     options.embedded.seedEnd = QDateTime::currentDateTimeUtc();
-    options.clientName = QStringLiteral("alarmsearch demo");
     if (!m_cli.openHost(options, &m_exitCode))
         return m_exitCode;
     m_cli.printOut(QStringLiteral("Plug-in loaded from %1.\nEmbedded alarm server in memory, "

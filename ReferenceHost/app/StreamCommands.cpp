@@ -76,7 +76,8 @@ int events(Cli& cli, const QStringList& arguments)
     QCommandLineParser parser;
     parser.setApplicationDescription(QStringLiteral(
         "Subscribes to AlarmUpdated and prints each event as a JSON line until Ctrl-C. Events "
-        "are published by the plug-in of this host, after updates made through it."));
+        "are published by the plug-in of this host, after updates made through it; with --host, "
+        "by the server's, after the updates of every operator."));
     parser.addOption(
         {QStringLiteral("count"), QStringLiteral("Stop after n events."), QStringLiteral("n")});
     int exitCode = Cli::ExitOk;
@@ -97,13 +98,17 @@ int events(Cli& cli, const QStringList& arguments)
     int received = 0;
     const EventHub::Listener print = eventPrinter(cli);
     const QString key = subscriptionKey(QStringLiteral("events"));
-    cli.session().subscribe(key, EVENT_ALARM_UPDATED,
-                            [&](const PluginObjBase_EventSignalInfo& info) {
-                                print(info);
-                                QMutexLocker locker(&mutex);
-                                ++received;
-                                arrived.wakeAll();
-                            });
+    QString error;
+    if (!cli.session().subscribe(
+            key, EVENT_ALARM_UPDATED,
+            [&](const PluginObjBase_EventSignalInfo& info) {
+                print(info);
+                QMutexLocker locker(&mutex);
+                ++received;
+                arrived.wakeAll();
+            },
+            &error))
+        return cli.fail(error);
     catchInterrupts();
     cli.printNote(QStringLiteral("waiting for %1 events; Ctrl-C to stop").arg(EVENT_ALARM_UPDATED));
     {
@@ -168,7 +173,7 @@ int batch(Cli& cli, const QStringList& arguments)
         if (method == METHOD_MUTE_ALARM) {
             cli.session().send(method, request.args);
             // Later lines must see the mute carried out.
-            if (!cli.host().tunnelClient().waitForIdle(cli.timeoutMs()))
+            if (!cli.session().waitForIdle(cli.timeoutMs()))
                 return cli.fail(
                     QStringLiteral("line %1: MuteAlarm not delivered in time").arg(lineNumber));
             cli.printOut(AnswerFormat::jsonLine(

@@ -1,11 +1,10 @@
 #include "AnswerFormat.h"
 
-#include <PluginAlarmSearchCommon.h>
-#include <PluginObjBase_EventInfo.h>
+#include "PlainJson.h"
 
-#include <QDateTime>
+#include <PluginAlarmSearchCommon.h>
+
 #include <QJsonDocument>
-#include <QJsonValue>
 
 using namespace PluginAlarmSearchCommon;
 
@@ -33,26 +32,15 @@ QVariant withoutAlarmXml(const QVariant& result)
 QJsonObject AnswerFormat::answerObject(const QString& method, const PluginAnswer& answer,
                                        bool keepXml)
 {
-    return QJsonObject{
-        {QStringLiteral("method"), method},
-        {QStringLiteral("isLast"), answer.isLast},
-        {QStringLiteral("resultCode"), answer.resultCode},
-        {QStringLiteral("message"), answer.message},
-        {QStringLiteral("result"),
-         QJsonValue::fromVariant(keepXml ? answer.result : withoutAlarmXml(answer.result))},
-    };
+    if (keepXml)
+        return PlainJson::answer(method, answer);
+    return PlainJson::answer(method, PluginAnswer{answer.isLast, answer.resultCode, answer.message,
+                                                  withoutAlarmXml(answer.result)});
 }
 
 QJsonObject AnswerFormat::eventObject(const PluginObjBase_EventSignalInfo& info)
 {
-    return QJsonObject{
-        {QStringLiteral("event"), info.eventName},
-        {QStringLiteral("time"),
-         QDateTime::fromMSecsSinceEpoch(info.eventTime, Qt::UTC).toString(Qt::ISODateWithMs)},
-        {QStringLiteral("subscriptionKey"), info.subscriptionKey},
-        {QStringLiteral("pluginId"), info.pluginId},
-        {QStringLiteral("data"), QJsonValue::fromVariant(info.eventData)},
-    };
+    return PlainJson::event(info);
 }
 
 QByteArray AnswerFormat::jsonLine(const QJsonObject& object, bool pretty)

@@ -12,8 +12,8 @@ class PluginObjBase_EventSignalInfo;
 class AnswerFormat
 {
 public:
-    // {"method", "isLast", "resultCode", "message", "result"}. Without keepXml the raw XML text
-    // that comes with each alarm of a search is left out.
+    // PlainJson's answer object. Without keepXml the raw XML text that comes with each alarm of a
+    // search is left out.
     static QJsonObject answerObject(const QString& method, const PluginAnswer& answer,
                                     bool keepXml);
     static QJsonObject eventObject(const PluginObjBase_EventSignalInfo& info);

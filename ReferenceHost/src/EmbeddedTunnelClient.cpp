@@ -10,7 +10,7 @@ EmbeddedTunnelClient::~EmbeddedTunnelClient()
     m_pool.waitForDone();
 }
 
-bool EmbeddedTunnelClient::InsertRequest(const QString& /*pluginId*/, void* /*clientID*/,
+bool EmbeddedTunnelClient::InsertRequest(const QString& /*pluginId*/, void* clientID,
                                          int requestKind, const QString& method,
                                          InsertRequestInfo& info)
 {
@@ -22,8 +22,8 @@ bool EmbeddedTunnelClient::InsertRequest(const QString& /*pluginId*/, void* /*cl
 
     ReplyCallback callback = withReply ? info.replyCallback : ReplyCallback();
     m_pool.start([this, method, command = info.commandText, relayPath = info.relayPath,
-                  callback = std::move(callback)] {
-        const AlarmServerSim::CommandReply reply = m_execute(method, command);
+                  operatorName = operatorOf(clientID), callback = std::move(callback)] {
+        const AlarmServerSim::CommandReply reply = m_execute(method, command, operatorName);
         if (callback)
             callback(true, QString(), relayPath, reply.statusText, reply.replyText, true);
     });

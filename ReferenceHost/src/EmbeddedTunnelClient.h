@@ -13,8 +13,8 @@ class EmbeddedTunnelClient : public HostTunnelClient
 {
 public:
     // Carries out one command; called on pool threads, concurrently.
-    using CommandExecutor =
-        std::function<AlarmServerSim::CommandReply(const QString& method, const QString& command)>;
+    using CommandExecutor = std::function<AlarmServerSim::CommandReply(
+        const QString& method, const QString& command, const QString& operatorName)>;
 
     explicit EmbeddedTunnelClient(CommandExecutor executor);
     ~EmbeddedTunnelClient() override;

@@ -1,5 +1,7 @@
 #include "HostSession.h"
 
+#include "HostTunnelClient.h"
+
 #include <IPluginObjectBase.h>
 #include <IResponser.h>
 
@@ -30,17 +32,20 @@ struct AnswerCollector
 
 } // namespace
 
-HostSession::HostSession(IPluginObjectBase& plugin, EventHub& eventHub, const QString& clientName)
-    : m_plugin(plugin), m_eventHub(eventHub)
+HostSession::HostSession(IPluginObjectBase& plugin, EventHub& eventHub,
+                         HostTunnelClient& tunnelClient, const QString& operatorName)
+    : m_plugin(plugin), m_eventHub(eventHub), m_tunnelClient(tunnelClient)
 {
     // The handle only has to tell clients apart; the session's address does.
     m_sender.clientHandle = this;
-    m_sender.clientName = clientName;
+    m_sender.clientName = operatorName;
 }
 
 HostSession::~HostSession()
 {
+    QMutexLocker locker(&m_listenerMutex);
     const QStringList keys = m_listenerIds.keys();
+    locker.unlock();
     for (const QString& key : keys)
         unsubscribe(key);
 }
@@ -78,23 +83,35 @@ void HostSession::send(const QString& method, const QVariant& args)
                      [](bool, const QString&, const QString&, const QVariant&) {});
 }
 
-void HostSession::subscribe(const QString& subscriptionKey, const QString& eventName,
-                            EventHub::Listener listener)
+bool HostSession::waitForIdle(int timeoutMs)
+{
+    return m_tunnelClient.waitForIdle(timeoutMs);
+}
+
+bool HostSession::subscribe(const QString& subscriptionKey, const QString& eventName,
+                            EventHub::Listener listener, QString* /*errorMessage*/)
 {
     unsubscribe(subscriptionKey);
-    m_listenerIds.insert(subscriptionKey,
-                         m_eventHub.addListener(subscriptionKey, std::move(listener)));
+    {
+        QMutexLocker locker(&m_listenerMutex);
+        m_listenerIds.insert(subscriptionKey,
+                             m_eventHub.addListener(subscriptionKey, std::move(listener)));
+    }
     SilentResponser responser;
     m_plugin.SubscribeEventBlock(subscriptionKey, eventName, QVariant(), m_sender, responser);
+    return true;
 }
 
 void HostSession::unsubscribe(const QString& subscriptionKey)
 {
+    QMutexLocker locker(&m_listenerMutex);
     const auto it = m_listenerIds.find(subscriptionKey);
     if (it == m_listenerIds.end())
         return;
+    const int listenerId = it.value();
+    m_listenerIds.erase(it);
+    locker.unlock();
     SilentResponser responser;
     m_plugin.UnsubscribeEventBlock(subscriptionKey, QVariant(), responser);
-    m_eventHub.removeListener(it.value());
-    m_listenerIds.erase(it);
+    m_eventHub.removeListener(listenerId);
 }

@@ -1,51 +1,43 @@
 #pragma once
 
-#include "EventHub.h"
+#include "ClientSession.h"
 
 #include <RequestSenderInfo.h>
 
-#include <QList>
-#include <QString>
-#include <QStringList>
-#include <QVariant>
+#include <QHash>
+#include <QMutex>
 
+class HostTunnelClient;
 class IPluginObjectBase;
 
-// One answer of a plug-in to a request, as its request callback delivered it.
-struct PluginAnswer
-{
-    bool isLast = false;
-    QString resultCode;
-    QString message;
-    QVariant result;
-};
-
-// A client of a started plug-in: sends requests and waits for their answers, and manages event
-// subscriptions. Requests go out on the calling thread; answers and events arrive on the tunnel
-// client's threads.
-class HostSession
+// A client of a plug-in started in this process, acting for one operator: sends requests and
+// waits for their answers, and manages event subscriptions. Requests go out on the calling
+// thread (any thread); answers and events arrive on the tunnel client's threads. The session's
+// address is the client handle the plug-in passes on to the tunnel client with each command.
+class HostSession : public ClientSession
 {
 public:
-    HostSession(IPluginObjectBase& plugin, EventHub& eventHub, const QString& clientName);
-    ~HostSession();
+    HostSession(IPluginObjectBase& plugin, EventHub& eventHub, HostTunnelClient& tunnelClient,
+                const QString& operatorName);
+    ~HostSession() override;
     HostSession(const HostSession&) = delete;
     HostSession& operator=(const HostSession&) = delete;
 
-    // Sends a request and collects its answers up to the last one. False with errorMessage set
-    // when no last answer came within timeoutMs.
-    bool call(const QString& method, const QVariant& args, int timeoutMs,
-              QList<PluginAnswer>* answers, QString* errorMessage);
-    // Sends a request that gets no answer ("MuteAlarm").
-    void send(const QString& method, const QVariant& args);
+    const QString& operatorName() const { return m_sender.clientName; }
 
-    // Subscribes to an event under a key of this session; listener gets every record for it.
-    void subscribe(const QString& subscriptionKey, const QString& eventName,
-                   EventHub::Listener listener);
-    void unsubscribe(const QString& subscriptionKey);
+    bool call(const QString& method, const QVariant& args, int timeoutMs,
+              QList<PluginAnswer>* answers, QString* errorMessage) override;
+    void send(const QString& method, const QVariant& args) override;
+    bool waitForIdle(int timeoutMs) override;
+    bool subscribe(const QString& subscriptionKey, const QString& eventName,
+                   EventHub::Listener listener, QString* errorMessage = nullptr) override;
+    void unsubscribe(const QString& subscriptionKey) override;
 
 private:
     IPluginObjectBase& m_plugin;
     EventHub& m_eventHub;
+    HostTunnelClient& m_tunnelClient;
     RequestSenderInfo m_sender;
+    QMutex m_listenerMutex;
     QHash<QString, int> m_listenerIds;
 };

@@ -5,6 +5,8 @@
 
 #include <PluginAlarmSearchCommon.h>
 
+#include <QRegularExpression>
+
 using namespace PluginAlarmSearchCommon;
 
 namespace {
@@ -112,5 +114,75 @@ bool QueryArguments::build(const QueryFilter& filter, const QDateTime& now, QVar
         args->insert(ARG_START_TIME, startTime);
     if (!endTime.isEmpty())
         args->insert(ARG_END_TIME, endTime);
+    return true;
+}
+
+namespace {
+
+QString unescaped(QString text)
+{
+    return text.replace(QLatin1String("&lt;"), QLatin1String("<"))
+        .replace(QLatin1String("&gt;"), QLatin1String(">"))
+        .replace(QLatin1String("&quot;"), QLatin1String("\""))
+        .replace(QLatin1String("&amp;"), QLatin1String("&"));
+}
+
+// The texts of the elements the pattern matches; false when anything but blanks stands between.
+bool elementTexts(const QString& text, const QRegularExpression& pattern,
+                  QList<QRegularExpressionMatch>* matches)
+{
+    qsizetype at = 0;
+    auto it = pattern.globalMatch(text);
+    while (it.hasNext()) {
+        const QRegularExpressionMatch match = it.next();
+        if (!text.mid(at, match.capturedStart() - at).trimmed().isEmpty())
+            return false;
+        matches->append(match);
+        at = match.capturedEnd();
+    }
+    return text.mid(at).trimmed().isEmpty();
+}
+
+} // namespace
+
+bool QueryArguments::filterOf(const QVariantMap& args, QueryFilter* filter, QString* errorMessage)
+{
+    static const QRegularExpression event(
+        QStringLiteral("<Event(?:\\s+\\w+=\"([^\"]*)\")?\\s*>([^<]*)</Event>"));
+    static const QRegularExpression state(QStringLiteral("<State>([^<]*)</State>"));
+    *filter = QueryFilter();
+    QList<QRegularExpressionMatch> matches;
+    if (!elementTexts(args.value(ARG_TRIGGER_EVENT_FILTER).toString(), event, &matches)) {
+        *errorMessage = QStringLiteral("this trigger-event filter has no CLASS[:SUBEVENT] form");
+        return false;
+    }
+    for (const QRegularExpressionMatch& match : std::as_const(matches)) {
+        const QString eventClass = unescaped(match.captured(2).trimmed());
+        filter->events.append(match.captured(1).isNull()
+                                  ? eventClass
+                                  : eventClass + QLatin1Char(':') + unescaped(match.captured(1)));
+    }
+    QString states = args.value(ARG_STATE_FILTER).toString().trimmed();
+    if (states.startsWith(QLatin1String("<AlarmStateList>")) &&
+        states.endsWith(QLatin1String("</AlarmStateList>")))
+        states = states.mid(16, states.size() - 16 - 17);
+    matches.clear();
+    if (!elementTexts(states, state, &matches)) {
+        *errorMessage = QStringLiteral("this state filter is no list of states");
+        return false;
+    }
+    for (const QRegularExpressionMatch& match : std::as_const(matches))
+        filter->states.append(match.captured(1).trimmed());
+    for (const QVariant& rule : args.value(ARG_RULES).toList()) {
+        const QVariantMap fields = rule.toMap();
+        const int type = fields.value(QStringLiteral("type")).toInt();
+        const QStringList tags = fields.value(QStringLiteral("tagList")).toStringList();
+        if (type == 0)
+            filter->names += tags;
+        else if (type == 1)
+            filter->devices += tags;
+    }
+    filter->from = args.value(ARG_START_TIME).toString();
+    filter->to = args.value(ARG_END_TIME).toString();
     return true;
 }

@@ -30,6 +30,10 @@ public:
     static QString method(const QueryFilter& filter);
     static bool build(const QueryFilter& filter, const QDateTime& now, QVariantMap* args,
                       QString* errorMessage);
+    // The search terms an argument map of build() was made from, for a client that hands the
+    // terms to a server which builds the map itself. Fails on filter texts that build() cannot
+    // have written.
+    static bool filterOf(const QVariantMap& args, QueryFilter* filter, QString* errorMessage);
     // A state as the server spells it, from any letter case, with or without "-" or "_".
     static bool canonicalState(const QString& text, QString* state, QString* errorMessage);
     // The state filter element for states already in the server's spelling.

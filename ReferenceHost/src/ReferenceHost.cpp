@@ -13,7 +13,8 @@ ReferenceHost::ReferenceHost() = default;
 
 ReferenceHost::~ReferenceHost()
 {
-    m_session.reset();
+    qDeleteAll(m_sessions);
+    m_sessions.clear();
     m_framework.reset();
     m_tunnelClient.reset();
     m_server.reset();
@@ -28,13 +29,36 @@ bool ReferenceHost::open(const Options& options, QString* errorMessage)
         return false;
     if (!openTunnel(options, errorMessage))
         return false;
+    m_tunnelClient->setOperatorLookup([this](void* clientID) { return operatorOf(clientID); });
     m_framework = std::make_unique<HostFramework>(m_tunnelClient.get(), *m_eventHub);
     if (!m_loader->plugin()->InitialPluginBase(m_framework.get())) {
         *errorMessage = QStringLiteral("the plug-in refused to start");
         return false;
     }
-    m_session = std::make_unique<HostSession>(*m_loader->plugin(), *m_eventHub, options.clientName);
+    m_session = &session(options.operatorName);
     return true;
+}
+
+HostSession& ReferenceHost::session(const QString& operatorName)
+{
+    {
+        QReadLocker locker(&m_sessionsLock);
+        if (HostSession* session = m_sessions.value(operatorName))
+            return *session;
+    }
+    QWriteLocker locker(&m_sessionsLock);
+    HostSession*& session = m_sessions[operatorName];
+    if (!session) {
+        session = new HostSession(*m_loader->plugin(), *m_eventHub, *m_tunnelClient, operatorName);
+        m_operators.insert(session, operatorName);
+    }
+    return *session;
+}
+
+QString ReferenceHost::operatorOf(void* clientHandle) const
+{
+    QReadLocker locker(&m_sessionsLock);
+    return m_operators.value(clientHandle);
 }
 
 bool ReferenceHost::openTunnel(const Options& options, QString* errorMessage)
@@ -45,8 +69,8 @@ bool ReferenceHost::openTunnel(const Options& options, QString* errorMessage)
             return false;
         AlarmServerSim::AlarmServer* server = m_server.get();
         m_tunnelClient = std::make_unique<EmbeddedTunnelClient>(
-            [server](const QString& method, const QString& command) {
-                return server->execute(method, command);
+            [server](const QString& method, const QString& command, const QString& operatorName) {
+                return server->execute(method, command, operatorName);
             });
         return true;
     }

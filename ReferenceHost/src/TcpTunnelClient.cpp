@@ -32,8 +32,8 @@ bool TcpTunnelClient::connectToServer(const QString& host, quint16 port, int tim
     return connected;
 }
 
-bool TcpTunnelClient::InsertRequest(const QString& /*pluginId*/, void* /*clientID*/,
-                                    int requestKind, const QString& method, InsertRequestInfo& info)
+bool TcpTunnelClient::InsertRequest(const QString& /*pluginId*/, void* clientID, int requestKind,
+                                    const QString& method, InsertRequestInfo& info)
 {
     const bool withReply = requestKind == RequestWithReply;
     if (!withReply && requestKind != RequestNoReply)
@@ -45,6 +45,7 @@ bool TcpTunnelClient::InsertRequest(const QString& /*pluginId*/, void* /*clientI
     request.id = m_nextId++;
     request.method = method;
     request.command = info.commandText;
+    request.operatorName = operatorOf(clientID);
     request.relayPath = info.relayPath;
     request.timeoutMs = info.timeoutMs;
     if (withReply)

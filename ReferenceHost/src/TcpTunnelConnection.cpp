@@ -46,9 +46,11 @@ void TcpTunnelConnection::send(const Request& request)
         m_pendingWork.end();
         return;
     }
-    const QJsonObject payload{{QStringLiteral("id"), request.id},
-                              {QStringLiteral("method"), request.method},
-                              {QStringLiteral("command"), request.command}};
+    QJsonObject payload{{QStringLiteral("id"), request.id},
+                        {QStringLiteral("method"), request.method},
+                        {QStringLiteral("command"), request.command}};
+    if (!request.operatorName.isEmpty())
+        payload.insert(QStringLiteral("operator"), request.operatorName);
     m_socket->write(AlarmServerSim::encodeFrame(payload));
     if (!request.callback) {
         m_socket->flush();

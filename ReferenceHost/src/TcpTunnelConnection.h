@@ -25,6 +25,7 @@ public:
         qint64 id = 0;
         QString method;
         QString command;
+        QString operatorName; // who asked; left out of the frame when empty
         QString relayPath;
         int timeoutMs = 0;
         IOrvoTunnelClient::ReplyCallback callback; // empty: no reply expected
