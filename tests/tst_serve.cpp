@@ -390,6 +390,27 @@ private slots:
                  QStringLiteral("from the CLI"));
     }
 
+    // An unknown alarm is named, and the command fails, as without --host.
+    void cliNamesUnknownAlarms_data()
+    {
+        QTest::addColumn<QStringList>("arguments");
+        QTest::newRow("history") << QStringList{QStringLiteral("history"), QStringLiteral("NOPE")};
+        QTest::newRow("mute") << QStringList{QStringLiteral("mute"), QStringLiteral("NOPE"),
+                                             QStringLiteral("A0000001")};
+    }
+
+    void cliNamesUnknownAlarms()
+    {
+        QFETCH(QStringList, arguments);
+        QProcess cli;
+        cli.start(QStringLiteral(ALARMSEARCH_CLI_EXE),
+                  arguments + QStringList{QStringLiteral("--host"), m_server->url.toString()});
+        QVERIFY(cli.waitForFinished(60000));
+        QCOMPARE(cli.exitStatus(), QProcess::NormalExit);
+        QCOMPARE(cli.exitCode(), 1);
+        QVERIFY(cli.readAllStandardError().contains("unknown alarm: NOPE"));
+    }
+
 private:
     std::unique_ptr<Server> m_server;
 };

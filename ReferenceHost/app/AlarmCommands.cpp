@@ -38,7 +38,7 @@ bool findUnknownAlarms(Cli& cli, const QStringList& ids, QStringList* unknown, i
             return false;
         if (answers.constLast().resultCode == QLatin1String("0"))
             continue;
-        const QString lost = cli.host().tunnelClient().connectionError();
+        const QString lost = cli.connectionError();
         if (!lost.isEmpty()) {
             *exitCode = cli.fail(lost);
             return false;
@@ -209,7 +209,7 @@ int history(Cli& cli, const QStringList& arguments)
         return exitCode;
     if (answers.constLast().resultCode != QLatin1String("0")) {
         // The server answers an alarm it does not know with a failure.
-        const QString lost = cli.host().tunnelClient().connectionError();
+        const QString lost = cli.connectionError();
         return cli.fail(lost.isEmpty() ? unknownAlarmsMessage({id}) : lost);
     }
     for (const PluginAnswer& answer : std::as_const(answers))

@@ -356,9 +356,14 @@ bool Cli::call(const QString& method, const QVariant& args, QList<PluginAnswer>*
     return false;
 }
 
+QString Cli::connectionError() const
+{
+    return m_host ? m_host->tunnelClient().connectionError() : QString();
+}
+
 QString Cli::answerError(const QString& method, const PluginAnswer& answer)
 {
-    const QString lost = m_host ? m_host->tunnelClient().connectionError() : QString();
+    const QString lost = connectionError();
     if (!lost.isEmpty())
         return lost;
     if (answer.resultCode.isEmpty())

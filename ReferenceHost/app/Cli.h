@@ -39,6 +39,9 @@ public:
     ReferenceHost& host() { return *m_host; }
     // Whether --host (or $ALARMSEARCH_HOST) names a running server to talk to.
     bool isRemote() const { return !remoteHost().isEmpty(); }
+    // Why requests fail for want of a connection to the server in this process; empty while
+    // they can reach it, and with --host (where the answer's result code says it).
+    QString connectionError() const;
 
     // Sends a request and waits for its answers; on timeout reports it and sets exitCode.
     bool call(const QString& method, const QVariant& args, QList<PluginAnswer>* answers,
