@@ -1,10 +1,13 @@
 #include <AlarmPager.h>
 #include <ExportWriter.h>
+#include <PlainJson.h>
 #include <QueryArguments.h>
 #include <TimeArgument.h>
 
 #include <PluginAlarmSearchCommon.h>
 
+#include <QJsonArray>
+#include <QJsonObject>
 #include <QtTest>
 
 using namespace PluginAlarmSearchCommon;
@@ -126,6 +129,15 @@ private slots:
         QCOMPARE(args.value(ARG_START_TIME).toString(), QStringLiteral("2026-11-01T00:00:00"));
         QVERIFY(!args.contains(ARG_END_TIME));
 
+        // A client of a remote host sends the terms, from which the server builds the same map.
+        QueryFilter terms;
+        QVERIFY2(QueryArguments::filterOf(args, &terms, &error), qPrintable(error));
+        QVariantMap rebuilt;
+        QVERIFY(QueryArguments::build(terms, kNow, &rebuilt, &error));
+        QCOMPARE(rebuilt, args);
+        QVERIFY(!QueryArguments::filterOf({{ARG_STATE_FILTER, QStringLiteral("<Or/>")}}, &terms,
+                                          &error));
+
         QueryFilter groups;
         groups.eventGroups = QStringList{QStringLiteral("System"), QStringLiteral("external")};
         groups.unhandledOnly = true;
@@ -232,6 +244,28 @@ private slots:
         QVERIFY(pager.fetchAll(QVariantMap(), &found, &error));
         QCOMPARE(found.size(), AlarmPager::kMaxRecords);
         QVERIFY(pager.warning().contains(QStringLiteral("may be missing")));
+    }
+
+    void plainJsonTypesKnownFields()
+    {
+        const QVariantMap alarm{
+            {QStringLiteral("Muted"), QStringLiteral("true")},
+            {QStringLiteral("ServerTime"), QStringLiteral("2026-11-20T08:00:00")},
+            {QStringLiteral("MuteUntil"), QString()},
+            {QStringLiteral("Note"), QStringLiteral("123")},
+            {ARG_UPDATE_RESULT, QStringLiteral("1")}};
+        const QJsonObject expected{
+            {QStringLiteral("Muted"), true},
+            {QStringLiteral("ServerTime"), QStringLiteral("2026-11-20T08:00:00Z")},
+            {QStringLiteral("MuteUntil"), QJsonValue::Null},
+            {QStringLiteral("Note"), QStringLiteral("123")},
+            {ARG_UPDATE_RESULT, 1}};
+        const QJsonValue plain = PlainJson::value(QVariantList{alarm});
+        QCOMPARE(plain, QJsonValue(QJsonArray{expected}));
+        // Typed values stay as they are, as when a remote host's answer is printed again.
+        QCOMPARE(PlainJson::value(plain.toVariant()), plain);
+        QCOMPARE(PlainJson::time(QStringLiteral("2026-11-20T10:00:00+02:00")),
+                 QJsonValue(QStringLiteral("2026-11-20T08:00:00Z")));
     }
 
     void csvQuotesAndRepeatsAlarmFields()

@@ -118,7 +118,8 @@ private slots:
         QStringList executed;
         ReplySink sink;
         {
-            EmbeddedTunnelClient client([&](const QString& method, const QString& command) {
+            EmbeddedTunnelClient client([&](const QString& method, const QString& command,
+                                            const QString&) {
                 QMutexLocker locker(&mutex);
                 executed.append(method + QLatin1Char('|') + command);
                 return AlarmServerSim::CommandReply{QStringLiteral("0"), QStringLiteral("<R/>")};
@@ -162,7 +163,7 @@ private slots:
         QFETCH(bool, withCallback);
         int executions = 0;
         ReplySink sink;
-        EmbeddedTunnelClient client([&](const QString&, const QString&) {
+        EmbeddedTunnelClient client([&](const QString&, const QString&, const QString&) {
             ++executions;
             return AlarmServerSim::CommandReply();
         });
@@ -178,7 +179,7 @@ private slots:
     {
         ReplySink sink;
         {
-            EmbeddedTunnelClient client([](const QString&, const QString&) {
+            EmbeddedTunnelClient client([](const QString&, const QString&, const QString&) {
                 QThread::msleep(20);
                 return AlarmServerSim::CommandReply{QStringLiteral("0"), QString()};
             });

@@ -8,6 +8,8 @@
 
 #include <csignal>
 
+#include <sys/resource.h>
+
 namespace {
 
 volatile std::sig_atomic_t g_stopRequested = 0;
@@ -15,6 +17,17 @@ volatile std::sig_atomic_t g_stopRequested = 0;
 extern "C" void onStopSignal(int)
 {
     g_stopRequested = 1;
+}
+
+// Every client holds a socket, and a WebSocket subscriber stays: the soft limit of open files
+// (often 1024) is raised to the hard one.
+void raiseOpenFileLimit()
+{
+    rlimit limit{};
+    if (getrlimit(RLIMIT_NOFILE, &limit) == 0 && limit.rlim_cur < limit.rlim_max) {
+        limit.rlim_cur = limit.rlim_max;
+        setrlimit(RLIMIT_NOFILE, &limit);
+    }
 }
 
 bool readListen(const QString& text, ApiServer::Options* options)
@@ -72,11 +85,14 @@ int serve(Cli& cli, const QStringList& arguments)
     options.timeoutMs = cli.timeoutMs();
     if (cli.isRemote())
         return cli.usageError(QStringLiteral("serve is the server; it takes no --host"));
+    QString error;
+    if (!ApiServer::checkAddress(options, &error))
+        return cli.fail(error);
+    raiseOpenFileLimit();
     if (!cli.openHost(&exitCode))
         return exitCode;
 
     ApiServer server(cli.host());
-    QString error;
     if (!server.listen(options, &error))
         return cli.fail(error);
     cli.printOut(QStringLiteral("listening on %1\n").arg(server.url().toString()).toUtf8());

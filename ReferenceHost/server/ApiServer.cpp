@@ -88,6 +88,23 @@ QJsonObject answerHead(const QString& method, const QString& resultCode)
             {QStringLiteral("resultCode"), resultCode}};
 }
 
+QByteArray upgradeRequired()
+{
+    return QJsonDocument(QJsonObject{{QStringLiteral("error"), QStringLiteral("upgrade required")},
+                                     {QStringLiteral("problem"),
+                                      QStringLiteral("open a WebSocket on this path")}})
+        .toJson(QJsonDocument::Compact);
+}
+
+QByteArray authorization(const QHttpServerRequest& request)
+{
+#if QT_VERSION >= QT_VERSION_CHECK(6, 8, 0)
+    return request.headers().value(QHttpHeaders::WellKnownHeader::Authorization).toByteArray();
+#else
+    return request.value(QByteArrayLiteral("authorization"));
+#endif
+}
+
 QHttpServerResponse toResponse(const Reply& reply)
 {
     const QByteArray bytes =
@@ -111,17 +128,24 @@ ApiServer::~ApiServer()
     stop();
 }
 
-bool ApiServer::listen(const Options& options, QString* errorMessage)
+bool ApiServer::checkAddress(const Options& options, QString* errorMessage)
 {
-    m_options = options;
-    if (!options.usersFile.isEmpty() && !m_users.load(options.usersFile, errorMessage))
-        return false;
-    if (m_users.isEmpty() && !options.address.isLoopback()) {
+    if (options.usersFile.isEmpty() && !options.address.isLoopback()) {
         *errorMessage = QStringLiteral("%1 is not a loopback address: give a users file "
                                        "(--users) so that operators are known by their tokens")
                             .arg(options.address.toString());
         return false;
     }
+    return true;
+}
+
+bool ApiServer::listen(const Options& options, QString* errorMessage)
+{
+    m_options = options;
+    if (!options.usersFile.isEmpty() && !m_users.load(options.usersFile, errorMessage))
+        return false;
+    if (!checkAddress(options, errorMessage))
+        return false;
     addRoutes();
     m_tcpServer = new GuardedTcpServer(ApiRequest::kMaxBodyBytes);
     if (!m_tcpServer->listen(options.address, options.port)) {
@@ -162,13 +186,15 @@ void ApiServer::stop()
     qDeleteAll(findChildren<EventSocket*>());
     m_host.session().unsubscribe(m_outcomeKey);
     m_pool.waitForDone();
-    // Hands the last answers to their sockets.
-    QCoreApplication::processEvents();
-    // Event deliveries still running on reply threads post to this object.
-    m_host.tunnelClient().waitForIdle(m_options.timeoutMs);
+    // Hands the last answers to their sockets, then closes the connections; a request read
+    // meanwhile is still carried out.
     QCoreApplication::processEvents();
     m_tcpServer = nullptr;
     m_http.reset();
+    m_pool.waitForDone();
+    // Event deliveries still running on reply threads post to this object.
+    m_host.tunnelClient().waitForIdle(m_options.timeoutMs);
+    QCoreApplication::processEvents();
 }
 
 void ApiServer::addRoutes()
@@ -180,8 +206,8 @@ void ApiServer::addRoutes()
                                                     : QHttpServerRequest::Method::Post;
         const auto dispatch = [this, route](const QHttpServerRequest& request,
                                             const QString& alarmId) {
-            Call call{request.url().path(), alarmId, request.body(),
-                      request.value(QByteArrayLiteral("authorization")), QElapsedTimer()};
+            Call call{request.url().path(), alarmId, request.body(), authorization(request),
+                      QElapsedTimer()};
             call.started.start();
             return QtConcurrent::run(&m_pool, [this, route, call] {
                 const Reply reply = handle(route, call);
@@ -193,6 +219,22 @@ void ApiServer::addRoutes()
             });
         };
         QString pattern = route.path;
+#if QT_VERSION < QT_VERSION_CHECK(6, 8, 0)
+        if (route.path == ApiRoutes::kEventsPath) {
+            // Qt HTTP Server 6.4 hands a WebSocket upgrade request to the routes too, after it
+            // upgraded the socket, which must then get no HTTP answer.
+            m_http->route(pattern, verb,
+                          [](const QHttpServerRequest& request, QHttpServerResponder&& responder) {
+                              if (request.value(QByteArrayLiteral("upgrade")).toLower() ==
+                                  "websocket")
+                                  return;
+                              qCInfo(lcServe).noquote() << "GET" << request.url().path() << 426;
+                              responder.write(upgradeRequired(), "application/json",
+                                              QHttpServerResponder::StatusCode(426));
+                          });
+            continue;
+        }
+#endif
         if (pattern.contains(QLatin1String("{alarmId}"))) {
             pattern.replace(QLatin1String("{alarmId}"), QLatin1String("<arg>"));
             m_http->route(pattern, verb, [dispatch](QString alarmId, const QHttpServerRequest& r) {
@@ -280,7 +322,11 @@ void ApiServer::acceptEventSockets()
         const QString origin = socket->origin();
         qCInfo(lcServe).noquote() << "WS" << path << key << "origin"
                                   << (origin.isEmpty() ? QStringLiteral("-") : origin);
-        if (path != ApiRoutes::kEventsPath)
+        ++m_openEventSockets;
+        connect(events, &QObject::destroyed, this, [this] { --m_openEventSockets; });
+        if (m_openEventSockets > EventSocket::kMaxSockets)
+            events->refuse(EventSocket::TooMany, QStringLiteral("too many subscribers"));
+        else if (path != ApiRoutes::kEventsPath)
             events->refuse(EventSocket::UnknownPath, QStringLiteral("unknown path"));
         else if (!originAllowed(origin))
             events->refuse(EventSocket::OriginRefused, QStringLiteral("origin not allowed"));
@@ -318,9 +364,7 @@ ApiServer::Reply ApiServer::handle(const ApiRoutes::Route& route, const Call& ca
 
     Reply reply;
     if (route.path == ApiRoutes::kEventsPath)
-        reply = json(
-            426, {{QStringLiteral("error"), QStringLiteral("upgrade required")},
-                  {QStringLiteral("problem"), QStringLiteral("open a WebSocket on this path")}});
+        reply = Reply{426, QJsonObject(), QString(), upgradeRequired()};
     else if (route.operationId == QLatin1String("getMe"))
         reply = json(200, {{QStringLiteral("user"), user}});
     else if (route.method == METHOD_QUERY_ALARM_LIST ||

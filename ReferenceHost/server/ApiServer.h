@@ -42,7 +42,8 @@ public:
     explicit ApiServer(ReferenceHost& host, QObject* parent = nullptr);
     ~ApiServer() override;
 
-    // Refuses a non-loopback address without a users file.
+    // Refuses a non-loopback address without a users file, before anything is started.
+    static bool checkAddress(const Options& options, QString* errorMessage);
     bool listen(const Options& options, QString* errorMessage);
     QUrl url() const;
     // Stops taking connections, closes the event sockets and waits for the requests in flight.
@@ -70,6 +71,7 @@ private:
     QThreadPool m_pool;
     std::atomic<qint64> m_nextRelay{1};
     qint64 m_nextSocket = 1;
+    int m_openEventSockets = 0;
     QString m_outcomeKey;
     QMutex m_outcomeMutex;
     QHash<QString, QJsonObject> m_outcomes; // event of an update in flight, by relay path

@@ -25,6 +25,7 @@ public:
     static constexpr int kMaxQueued = 256;
     static constexpr qint64 kMaxUnsentBytes = 1024 * 1024;
     static constexpr int kHelloTimeoutMs = 10000;
+    static constexpr int kMaxSockets = 10000; // open at once, per server
 
     // Close codes.
     enum Close {
@@ -33,7 +34,8 @@ public:
         OriginRefused = 4403,
         UnknownPath = 4404,
         HelloTimeout = 4408,
-        TooSlow = 4429
+        TooSlow = 4429,
+        TooMany = 4503
     };
 
     // The session of an operator, by name.

@@ -34,6 +34,8 @@ public:
 private:
     void inspect()
     {
+        if (!m_socket->isOpen())
+            return;
         if (m_refused) {
             m_socket->readAll();
             return;

@@ -54,13 +54,13 @@ RemoteConnection::Reply RemoteConnection::request(const QByteArray& verb, const 
     if (!m_token.isEmpty())
         request.setRawHeader(QByteArrayLiteral("Authorization"),
                              QByteArrayLiteral("Bearer ") + m_token.toUtf8());
-    request.setTransferTimeout(timeoutMs);
     QNetworkReply* reply =
         verb == "GET"
             ? m_network->get(request)
             : m_network->post(request, QJsonDocument(body).toJson(QJsonDocument::Compact));
     QEventLoop loop;
     connect(reply, &QNetworkReply::finished, &loop, &QEventLoop::quit);
+    QTimer::singleShot(timeoutMs, reply, &QNetworkReply::abort);
     connect(reply, &QNetworkReply::downloadProgress, reply, [reply](qint64 received, qint64) {
         if (received > kMaxReplyBytes)
             reply->abort();
