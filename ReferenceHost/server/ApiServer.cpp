@@ -240,23 +240,6 @@ void ApiServer::addRoutes()
             m_http->route(pattern, verb, [dispatch](QString alarmId, const QHttpServerRequest& r) {
                 return dispatch(r, QUrl::fromPercentEncoding(alarmId.toUtf8()));
             });
-        } else if (route.path == ApiRoutes::kEventsPath) {
-            // Qt before 6.8 also runs this route for a WebSocket upgrade, after the socket has
-            // gone over to the WebSocket server with its 101: an answer written then would
-            // corrupt the first frames, so an upgrade gets none. A plain GET gets its 426 here,
-            // on the server's thread: it asks nothing of the plug-in.
-            m_http->route(
-                pattern, verb,
-                [this, route](const QHttpServerRequest& r, QHttpServerResponder&& responder) {
-                    if (r.value(QByteArrayLiteral("upgrade"))
-                            .compare("websocket", Qt::CaseInsensitive) == 0)
-                        return;
-                    const Reply reply = handle(
-                        route, Call{r.url().path(), QString(), QByteArray(),
-                                    r.value(QByteArrayLiteral("authorization")), QElapsedTimer()});
-                    qCInfo(lcServe).noquote() << "GET" << r.url().path() << reply.status;
-                    toResponse(reply).write(std::move(responder));
-                });
         } else {
             m_http->route(pattern, verb, [dispatch](const QHttpServerRequest& r) {
                 return dispatch(r, QString());
