@@ -82,9 +82,10 @@ export class AlarmTable {
     historyButton.addEventListener('click', () => this.onHistory(id, historyButton));
     historyCell.append(historyButton);
 
-    tr.append(select, cell(displayTime(alarm.ServerTime), 'time'), cell(id, 'id'),
-              cell(alarm.AlarmName), cell(alarm.DeviceName), cell(eventText(alarm)),
-              stateCell, noteCell, muteCell, historyCell);
+    // The state comes early, so that a history panel over the right of the list leaves it seen.
+    tr.append(select, cell(displayTime(alarm.ServerTime), 'time'), stateCell, cell(id, 'id'),
+              cell(alarm.AlarmName, 'name'), cell(alarm.DeviceName, 'device'),
+              cell(eventText(alarm), 'event'), noteCell, muteCell, historyCell);
     const row = { alarm: { ...alarm }, tr, checkbox, stateCell, noteCell, muteCell };
     this.rows.set(id, row);
     this.showState(row);

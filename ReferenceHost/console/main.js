@@ -305,8 +305,15 @@ async function loadHistory(id) {
   if (!historyOf || historyOf.id !== id) return;
   const rows = (Array.isArray(answer.entries) ? answer.entries : []).map((entry) => {
     const tr = document.createElement('tr');
-    for (const text of [displayTime(entry.Time), STATE_LABELS[entry.State] || entry.State,
-                        entry.Note, entry.User]) {
+    // Date and time on lines of their own, to keep the panel narrow.
+    const when = document.createElement('td');
+    for (const part of displayTime(entry.Time).split(' ')) {
+      const span = document.createElement('span');
+      span.textContent = part;
+      when.append(span);
+    }
+    tr.append(when);
+    for (const text of [STATE_LABELS[entry.State] || entry.State, entry.Note, entry.User]) {
       const td = document.createElement('td');
       td.textContent = text === null || text === undefined ? '' : String(text);
       tr.append(td);
