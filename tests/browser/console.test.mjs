@@ -55,6 +55,8 @@ test('two operators handle alarms in their consoles', async () => {
     const second = await browser.newPage();
     const firstErrors = watchErrors(first, signInRefusal);
     const secondErrors = watchErrors(second, signInRefusal);
+    const urls = [];
+    browser.on('request', (request) => urls.push(request.url()));
     await signIn(first, serve.url, ALICE);
     await signIn(second, serve.url, BOB);
     assert.equal(await first.locator('#operator').textContent(), 'Operator: alice');
@@ -137,6 +139,7 @@ test('two operators handle alarms in their consoles', async () => {
 
     assert.deepEqual(firstErrors, []);
     assert.deepEqual(secondErrors, []);
+    assert.deepEqual(urls.filter((url) => url.includes(ALICE) || url.includes(BOB)), []);
   } finally {
     await browser.close();
     await serve.stop();
@@ -149,11 +152,20 @@ test('a console reconnects by itself when serve comes back', async () => {
   try {
     const page = await browser.newPage();
     let away = false;
-    const errors = watchErrors(
-      page, (text) => away && /ERR_CONNECTION_REFUSED|WebSocket connection/.test(text));
-    await page.goto(`${serve.url}/`);
+    // Expected: the refused search below, and the failed connections while serve is away.
+    const errors = watchErrors(page, (text) => /status of 400/.test(text) ||
+                               (away && /ERR_CONNECTION_REFUSED|WebSocket connection/.test(text)));
+    const response = await page.goto(`${serve.url}/`);
+    assert.match(response.headers()['content-security-policy'], /script-src 'self';/);
     await page.locator('#live-status.on').waitFor();
     assert.equal(await page.locator('#operator').textContent(), 'Operator: local');
+
+    // A search the server refuses is explained on the page.
+    await page.getByLabel('From').fill('yesterday');
+    await page.getByLabel('From').press('Enter');
+    await page.locator('#message').waitFor();
+    assert.match(await page.locator('#message').textContent(), /^bad request \(from\): \S/);
+    await page.getByLabel('From').fill('');
 
     away = true;
     const { port } = serve;
