@@ -1,7 +1,7 @@
 // The operator console in Debian's Chromium against a real `alarmsearch serve`.
 
 import assert from 'node:assert/strict';
-import { readFileSync } from 'node:fs';
+import { readFileSync, rmSync } from 'node:fs';
 import { join } from 'node:path';
 import { test } from 'node:test';
 
@@ -47,7 +47,8 @@ async function checkKeyboardAndLabels(page) {
 }
 
 test('two operators handle alarms in their consoles', async () => {
-  const serve = await startServe({ users: usersFile(scratch(), [
+  const dir = scratch();
+  const serve = await startServe({ users: usersFile(dir, [
     { name: 'alice', token: ALICE }, { name: 'bob', token: BOB }]) });
   const browser = await launchBrowser();
   try {
@@ -143,6 +144,7 @@ test('two operators handle alarms in their consoles', async () => {
   } finally {
     await browser.close();
     await serve.stop();
+    rmSync(dir, { recursive: true, force: true });
   }
 });
 

@@ -2,12 +2,13 @@
 // Debian's Chromium driven by playwright-core.
 
 import { spawn, execFile } from 'node:child_process';
-import { mkdtempSync, mkdirSync, writeFileSync } from 'node:fs';
+import { mkdtempSync, mkdirSync, rmSync, writeFileSync } from 'node:fs';
 import { tmpdir } from 'node:os';
 import { join } from 'node:path';
 import { promisify } from 'node:util';
 
 export const alarmsearch = process.env.ALARMSEARCH_BIN;
+if (!alarmsearch) throw new Error('set ALARMSEARCH_BIN to the alarmsearch executable (CTest does)');
 export const screenshots = process.env.ALARMSEARCH_SCREENSHOTS || join(tmpdir(), 'console-shots');
 mkdirSync(screenshots, { recursive: true });
 
@@ -62,8 +63,10 @@ export function startServe({ port = 0, users = null } = {}) {
 export const runCli = (args, env = {}) =>
   promisify(execFile)(alarmsearch, args, { env: { ...process.env, ...env }, timeout: 20000 });
 
-export function launchBrowser() {
-  return chromium.launchPersistentContext(scratch(), {
+// A fresh profile for each browser, removed when it closes.
+export async function launchBrowser() {
+  const profile = scratch();
+  const context = await chromium.launchPersistentContext(profile, {
     executablePath: '/usr/bin/chromium',
     headless: true,
     acceptDownloads: true,
@@ -71,6 +74,14 @@ export function launchBrowser() {
     args: ['--headless', '--no-sandbox', '--disable-gpu', '--disable-quic', '--no-first-run',
            '--disable-background-networking', '--disable-component-update', '--disable-sync'],
   });
+  context.on('close', () => {
+    try {
+      rmSync(profile, { recursive: true, force: true, maxRetries: 5 });
+    } catch {
+      // Chromium may still be writing it; a profile left in the temporary folder does no harm.
+    }
+  });
+  return context;
 }
 
 // Collects the page's console errors and uncaught exceptions; `allow` says which are expected.
