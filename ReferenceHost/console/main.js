@@ -66,16 +66,18 @@ function clearError() {
   $('message').textContent = '';
 }
 
-// Disables a button while its action runs, and shows the action's failure in words.
+// Runs a button's action once at a time and shows its failure in words. The button stays
+// enabled (marked busy), so that it keeps the keyboard focus.
 async function busy(button, action) {
-  button.disabled = true;
+  if (button.getAttribute('aria-busy') === 'true') return;
+  button.setAttribute('aria-busy', 'true');
   clearError();
   try {
     await action();
   } catch (error) {
     showError(error);
   } finally {
-    button.disabled = false;
+    button.removeAttribute('aria-busy');
   }
 }
 
@@ -162,15 +164,20 @@ function showPage(answer) {
   $('cap-notice').hidden = !nextBody;
   if (nextBody)
     $('cap-text').textContent =
-      `The server returns at most 5000 alarms per search: ${table.size} newest listed, ` +
-      'older ones are left out.';
+      `The server's limit per search cut this list: the ${table.size} newest alarms are ` +
+      'listed, older ones are left out.';
   const kind = search.unhandled ? 'unhandled alarms' : 'alarms';
   $('list-caption').textContent = `${table.size} ${kind}, newest first`;
 }
 
-// A search replaces the list; reading the same search again keeps the alarms selected.
+let searchesStarted = 0;
+
+// A search replaces the list; reading the same search again keeps the alarms selected. Only
+// the answer of the search started last is shown.
 async function runSearch(query) {
+  const started = ++searchesStarted;
   const answer = await api.search(query.body, query.unhandled);
+  if (started !== searchesStarted) return;
   const keep = query === search ? table.selectedIds() : [];
   search = query;
   table.clear();
@@ -191,7 +198,9 @@ for (const radio of document.querySelectorAll('input[name="scope"]'))
 $('load-older').addEventListener('click', () =>
   busy($('load-older'), async () => {
     if (!nextBody) return;
-    showPage(await api.search(nextBody, search.unhandled));
+    const started = searchesStarted;
+    const answer = await api.search(nextBody, search.unhandled);
+    if (started === searchesStarted) showPage(answer);
   }));
 
 // --- changing alarms ---
