@@ -171,7 +171,7 @@ test('a console reconnects by itself when serve comes back', async () => {
 
     away = true;
     const { port } = serve;
-    await serve.stop();
+    assert.equal(await serve.stop(), 0, 'serve stops cleanly with a console connected');
     await page.locator('#away-notice').waitFor();
     assert.match(await page.locator('#away-notice').textContent(),
                  /^Live updates lost since .*: reconnecting \(attempt \d+\)/);
