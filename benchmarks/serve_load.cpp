@@ -100,6 +100,7 @@ struct Throughput
     double p50 = 0;
     double p99 = 0;
     double serverCpuMs = 0; // per search
+    double serverCores = 0; // CPU time over wall time: how many cores the server kept busy
 };
 
 // clients connections, each asking again as soon as its answer is in, for seconds.
@@ -137,7 +138,8 @@ Throughput searchLoad(qint64 serverPid, int clients, const QJsonObject& body, do
     const double count = double(qMax<qsizetype>(1, latencies.size()));
     return Throughput{double(latencies.size()) / (double(clock.elapsed()) / 1000.0),
                       percentile(latencies, 0.5), percentile(latencies, 0.99),
-                      (cpuSeconds(serverPid) - cpuBefore) * 1000.0 / count};
+                      (cpuSeconds(serverPid) - cpuBefore) * 1000.0 / count,
+                      (cpuSeconds(serverPid) - cpuBefore) / (double(clock.elapsed()) / 1000.0)};
 }
 
 } // namespace
@@ -191,8 +193,9 @@ int main(int argc, char* argv[])
             if (clients == 1)
                 single = t.perSecond;
             std::printf("searches per second, %s pages, %2d clients: %.1f (p50 %.1f ms, p99 %.1f "
-                        "ms; server CPU %.1f ms per search)\n",
-                        qPrintable(name), clients, t.perSecond, t.p50, t.p99, t.serverCpuMs);
+                        "ms; server CPU %.1f ms per search, %.2f cores busy)\n",
+                        qPrintable(name), clients, t.perSecond, t.p50, t.p99, t.serverCpuMs,
+                        t.serverCores);
             if (clients == 32)
                 std::printf("throughput 32 clients / 1 client, %s pages: %.2fx (target >= 1.6x)\n",
                             qPrintable(name), single > 0 ? t.perSecond / single : 0.0);

@@ -6,7 +6,6 @@
 #include "GuardedTcpServer.h"
 
 #include <AlarmPager.h>
-#include <AnswerFormat.h>
 #include <HostSession.h>
 #include <HostTunnelClient.h>
 #include <PlainJson.h>
@@ -157,7 +156,7 @@ bool ApiServer::listen(const Options& options, QString* errorMessage)
         m_tcpServer = nullptr;
         return false;
     }
-    m_http->bind(m_tcpServer);
+    static_cast<void>(m_http->bind(m_tcpServer)); // void before Qt 6.8, bool after
     m_tcpServer->followHttpServer();
 
     m_outcomeKey = QStringLiteral("serve-outcomes-%1").arg(QCoreApplication::applicationPid());
@@ -381,7 +380,7 @@ ApiServer::Reply ApiServer::search(const Call& call, const QString& user, bool u
     if (answer.resultCode != QLatin1String("0"))
         return failed(search.method, answer.resultCode);
 
-    const QVariantList page = AnswerFormat::alarms(answer, search.keepXml);
+    const QVariantList page = answer.result.toMap().value(ARG_QUERY_RESULT).toList();
     const QSet<QString> excluded(search.exclude.cbegin(), search.exclude.cend());
     const QString idKey = QStringLiteral("AlarmID");
     const QString timeKey = QStringLiteral("ServerTime");
@@ -409,7 +408,9 @@ ApiServer::Reply ApiServer::search(const Call& call, const QString& user, bool u
         next = nextBody;
     }
     QJsonObject result = answerHead(search.method, answer.resultCode);
-    result.insert(QStringLiteral("alarms"), PlainJson::value(alarms));
+    // The alarms' XML texts are left out as they are converted, not copied out beforehand.
+    result.insert(QStringLiteral("alarms"),
+                  PlainJson::value(alarms, search.keepXml ? QString() : QStringLiteral("XML")));
     result.insert(QStringLiteral("truncated"), truncated);
     result.insert(QStringLiteral("next"), next);
     return json(200, result);

@@ -1,5 +1,7 @@
 #include "GuardedTcpServer.h"
 
+#include "ApiServer.h"
+
 #include <QJsonDocument>
 #include <QJsonObject>
 #include <QTcpSocket>
@@ -98,6 +100,11 @@ private:
     void refuse(int status, const QString& reason, const QString& problem)
     {
         m_refused = true;
+        // The request line, up to a length fit for a log.
+        qsizetype lineEnd = m_head.indexOf('\r');
+        if (lineEnd < 0 || lineEnd > 200)
+            lineEnd = 200;
+        qCInfo(lcServe).noquote() << m_head.left(lineEnd) << status << problem;
         const QByteArray body =
             QJsonDocument(QJsonObject{{QStringLiteral("error"), reason.toLower()},
                                       {QStringLiteral("field"), QStringLiteral("body")},

@@ -8,14 +8,22 @@ int EventHub::addListener(const QString& subscriptionKey, Listener listener)
 {
     QMutexLocker locker(&m_mutex);
     const int id = m_nextId++;
-    m_listeners.insert(id, Entry{subscriptionKey, std::move(listener)});
+    m_listeners[subscriptionKey].insert(id, std::move(listener));
+    m_keys.insert(id, subscriptionKey);
     return id;
 }
 
 void EventHub::removeListener(int listenerId)
 {
     QMutexLocker locker(&m_mutex);
-    m_listeners.remove(listenerId);
+    const auto key = m_keys.find(listenerId);
+    if (key == m_keys.end())
+        return;
+    const auto listeners = m_listeners.find(key.value());
+    listeners->remove(listenerId);
+    if (listeners->isEmpty())
+        m_listeners.erase(listeners);
+    m_keys.erase(key);
 }
 
 void EventHub::publish(const PluginObjBase_EventSignalInfo* info) const
@@ -26,11 +34,8 @@ void EventHub::publish(const PluginObjBase_EventSignalInfo* info) const
     QList<Listener> matching;
     {
         QMutexLocker locker(&m_mutex);
-        for (const Entry& entry : m_listeners) {
-            if (entry.subscriptionKey == info->subscriptionKey)
-                matching.append(entry.listener);
-        }
+        matching = m_listeners.value(info->subscriptionKey).values();
     }
-    for (const Listener& listener : matching)
+    for (const Listener& listener : std::as_const(matching))
         listener(*info);
 }

@@ -22,13 +22,9 @@ public:
     void publish(const PluginObjBase_EventSignalInfo* info) const;
 
 private:
-    struct Entry
-    {
-        QString subscriptionKey;
-        Listener listener;
-    };
-
     mutable QMutex m_mutex;
-    QHash<int, Entry> m_listeners;
+    // By subscription key, so that publishing to one of many keys finds its listeners at once.
+    QHash<QString, QHash<int, Listener>> m_listeners;
+    QHash<int, QString> m_keys; // subscription key by listener id
     int m_nextId = 1;
 };

@@ -70,15 +70,18 @@ QJsonValue time(const QString& text)
     return parsed.toString(parsed.time().msec() ? Qt::ISODateWithMs : Qt::ISODate);
 }
 
-QJsonValue value(const QVariant& value)
+QJsonValue value(const QVariant& value, const QString& omittedKey)
 {
     switch (value.typeId()) {
     case QMetaType::QVariantMap: {
         const QVariantMap map = value.toMap();
         QJsonObject object;
         for (auto it = map.constBegin(); it != map.constEnd(); ++it) {
+            if (it.key() == omittedKey)
+                continue;
             const Kind* kind = kindOf(it.key());
-            object.insert(it.key(), kind ? typed(*kind, it.value()) : PlainJson::value(it.value()));
+            object.insert(it.key(), kind ? typed(*kind, it.value())
+                                         : PlainJson::value(it.value(), omittedKey));
         }
         return object;
     }
@@ -86,7 +89,7 @@ QJsonValue value(const QVariant& value)
     case QMetaType::QStringList: {
         QJsonArray array;
         for (const QVariant& item : value.toList())
-            array.append(PlainJson::value(item));
+            array.append(PlainJson::value(item, omittedKey));
         return array;
     }
     default:

@@ -15,8 +15,9 @@ struct PluginAnswer;
 // that is typed already leaves it as it is.
 namespace PlainJson {
 
-// A value of an answer or event, converted field by field by the keys of its maps.
-QJsonValue value(const QVariant& value);
+// A value of an answer or event, converted field by field by the keys of its maps; map entries
+// called omittedKey (at any depth) are left out.
+QJsonValue value(const QVariant& value, const QString& omittedKey = QString());
 // A server time ("yyyy-MM-ddTHH:mm:ss", UTC) or an ISO 8601 time with a zone, as UTC with "Z";
 // an empty text is null, and a text that is no time stays as it is.
 QJsonValue time(const QString& text);
