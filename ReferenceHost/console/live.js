@@ -9,7 +9,8 @@ const RETRY_DELAYS_MS = [250, 500, 1000, 2000, 3000];
 const FINAL_CLOSES = {
   4400: 'the server did not understand the console',
   4401: 'the server did not accept your access token',
-  4403: 'the server refuses connections from this page\u2019s address',
+  4403: `the server refuses event connections from ${location.origin} ` +
+        '(serve admits further addresses with --allow-origin)',
   4404: 'the server has no event stream at this address',
 };
 
