@@ -101,12 +101,14 @@ struct Throughput
     double p99 = 0;
     double serverCpuMs = 0; // per search
     double serverCores = 0; // CPU time over wall time: how many cores the server kept busy
+    double clientCores = 0; // the same for this client
 };
 
 // clients connections, each asking again as soon as its answer is in, for seconds.
 Throughput searchLoad(qint64 serverPid, int clients, const QJsonObject& body, double seconds)
 {
     const double cpuBefore = cpuSeconds(serverPid);
+    const double clientBefore = cpuSeconds(QCoreApplication::applicationPid());
     const QByteArray bytes = QJsonDocument(body).toJson(QJsonDocument::Compact);
     QList<double> latencies;
     std::vector<std::unique_ptr<QNetworkAccessManager>> networks;
@@ -137,9 +139,12 @@ Throughput searchLoad(qint64 serverPid, int clients, const QJsonObject& body, do
     loop.exec();
     const double count = double(qMax<qsizetype>(1, latencies.size()));
     return Throughput{double(latencies.size()) / (double(clock.elapsed()) / 1000.0),
-                      percentile(latencies, 0.5), percentile(latencies, 0.99),
+                      percentile(latencies, 0.5),
+                      percentile(latencies, 0.99),
                       (cpuSeconds(serverPid) - cpuBefore) * 1000.0 / count,
-                      (cpuSeconds(serverPid) - cpuBefore) / (double(clock.elapsed()) / 1000.0)};
+                      (cpuSeconds(serverPid) - cpuBefore) / (double(clock.elapsed()) / 1000.0),
+                      (cpuSeconds(QCoreApplication::applicationPid()) - clientBefore) /
+                          (double(clock.elapsed()) / 1000.0)};
 }
 
 } // namespace
@@ -193,9 +198,9 @@ int main(int argc, char* argv[])
             if (clients == 1)
                 single = t.perSecond;
             std::printf("searches per second, %s pages, %2d clients: %.1f (p50 %.1f ms, p99 %.1f "
-                        "ms; server CPU %.1f ms per search, %.2f cores busy)\n",
+                        "ms; server CPU %.1f ms per search, %.2f cores busy; client %.2f cores)\n",
                         qPrintable(name), clients, t.perSecond, t.p50, t.p99, t.serverCpuMs,
-                        t.serverCores);
+                        t.serverCores, t.clientCores);
             if (clients == 32)
                 std::printf("throughput 32 clients / 1 client, %s pages: %.2fx (target >= 1.6x)\n",
                             qPrintable(name), single > 0 ? t.perSecond / single : 0.0);

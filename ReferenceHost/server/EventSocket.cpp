@@ -1,5 +1,6 @@
 #include "EventSocket.h"
 
+#include "ApiServer.h"
 #include "UserTokens.h"
 
 #include <ClientSession.h>
@@ -109,6 +110,8 @@ void EventSocket::readHello(const QString& message)
 
 void EventSocket::deliver(const QByteArray& message)
 {
+    if (!m_session)
+        return; // dropped already
     if (m_socket->bytesToWrite() > kMaxUnsentBytes)
         return dropAsTooSlow();
     m_socket->sendTextMessage(QString::fromUtf8(message));
@@ -117,9 +120,10 @@ void EventSocket::deliver(const QByteArray& message)
 void EventSocket::dropAsTooSlow()
 {
     m_outbox->overflowed = true;
-    if (m_session) {
-        m_session->unsubscribe(m_key);
-        m_session = nullptr;
-    }
+    if (!m_session)
+        return; // dropped already
+    qCInfo(lcServe).noquote() << "WS" << m_key << "dropped: too slow to read its events";
+    m_session->unsubscribe(m_key);
+    m_session = nullptr;
     refuse(TooSlow, QStringLiteral("too slow to read its events"));
 }
