@@ -1,6 +1,7 @@
 #!/usr/bin/env bash
 # Installs the Debian packages the build, the tests, the benchmarks, the fuzz targets and the
-# Debian packages' making and checking need.
+# Debian packages' making and checking need, and playwright-core for the browser tests (npm ci, at
+# the version package-lock.json pins).
 # Does nothing when all of them are present, so it is cheap to run before every build.
 set -euo pipefail
 
@@ -10,7 +11,10 @@ packages=(
     libbenchmark-dev
     clang-14 libclang-rt-14-dev
     help2man dpkg-dev lintian
+    chromium
 )
+# Node.js runs the browser tests: Debian's, unless a node is already installed.
+command -v node >/dev/null || packages+=(nodejs npm)
 
 missing=()
 for p in "${packages[@]}"; do
@@ -18,10 +22,18 @@ for p in "${packages[@]}"; do
         missing+=("$p")
     fi
 done
-[ ${#missing[@]} -eq 0 ] && exit 0
+if [ ${#missing[@]} -gt 0 ]; then
+    sudo=""
+    [ "$(id -u)" -ne 0 ] && sudo="sudo"
+    echo "Installing: ${missing[*]}" >&2
+    $sudo apt-get update -qq
+    DEBIAN_FRONTEND=noninteractive $sudo apt-get install -y -qq --no-install-recommends \
+        "${missing[@]}" >&2
+fi
 
-sudo=""
-[ "$(id -u)" -ne 0 ] && sudo="sudo"
-echo "Installing: ${missing[*]}" >&2
-$sudo apt-get update -qq
-DEBIAN_FRONTEND=noninteractive $sudo apt-get install -y -qq --no-install-recommends "${missing[@]}" >&2
+cd "$(dirname "$0")/.."
+pinned() { node -p "require('./package-lock.json').packages['node_modules/playwright-core'].version"; }
+installed() { node -p "require('./node_modules/playwright-core/package.json').version" 2>/dev/null; }
+if [ "$(installed || true)" != "$(pinned)" ]; then
+    npm ci --no-audit --no-fund >&2
+fi

@@ -1,6 +1,7 @@
 #include "ApiServer.h"
 
 #include "ApiRequest.h"
+#include "ConsolePages.h"
 #include "EventSocket.h"
 #include "GuardedTcpServer.h"
 
@@ -197,6 +198,7 @@ void ApiServer::stop()
 
 void ApiServer::addRoutes()
 {
+    ConsolePages::addRoutes(*m_http, this);
     for (const ApiRoutes::Route& route : ApiRoutes::all()) {
         const QHttpServerRequest::Method verb = route.verb == ApiRoutes::Verb::Get
                                                     ? QHttpServerRequest::Method::Get
