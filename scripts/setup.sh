@@ -7,7 +7,7 @@ packages=(
     cmake ninja-build g++ pkg-config
     qt6-base-dev libqt6sql6-sqlite
     libpugixml-dev libbenchmark-dev
-    clang-14 libclang-rt-14-dev
+    clang libclang-rt-dev
 )
 
 missing=()
