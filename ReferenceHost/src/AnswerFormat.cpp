@@ -6,6 +6,7 @@
 #include <QDateTime>
 #include <QJsonDocument>
 #include <QJsonValue>
+#include <QTimeZone>
 
 using namespace PluginAlarmSearchCommon;
 
@@ -47,8 +48,8 @@ QJsonObject AnswerFormat::eventObject(const PluginObjBase_EventSignalInfo& info)
 {
     return QJsonObject{
         {QStringLiteral("event"), info.eventName},
-        {QStringLiteral("time"),
-         QDateTime::fromMSecsSinceEpoch(info.eventTime, Qt::UTC).toString(Qt::ISODateWithMs)},
+        {QStringLiteral("time"), QDateTime::fromMSecsSinceEpoch(info.eventTime, QTimeZone::utc())
+                                     .toString(QStringLiteral("yyyy-MM-ddTHH:mm:ss.zzz'Z'"))},
         {QStringLiteral("subscriptionKey"), info.subscriptionKey},
         {QStringLiteral("pluginId"), info.pluginId},
         {QStringLiteral("data"), QJsonValue::fromVariant(info.eventData)},
