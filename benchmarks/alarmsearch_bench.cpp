@@ -206,6 +206,18 @@ void BM_InfoReply(benchmark::State& state)
 }
 BENCHMARK(BM_InfoReply)->Unit(benchmark::kMicrosecond);
 
+// Whether a run failed or was skipped: Google Benchmark 1.8 replaced Run::error_occurred by
+// Run::skipped. The first overload is taken wherever the newer member exists.
+template <typename BenchmarkRun>
+auto runSkipped(const BenchmarkRun& run, int) -> decltype(run.skipped != 0)
+{
+    return run.skipped != 0;
+}
+template <typename BenchmarkRun> bool runSkipped(const BenchmarkRun& run, long)
+{
+    return run.error_occurred;
+}
+
 // Keeps the fastest CPU time per benchmark, over repetitions, besides the usual console output.
 // CPU time rather than wall time: the ratio then holds on a machine that other work shares.
 class FastestReporter : public benchmark::ConsoleReporter
@@ -214,7 +226,7 @@ public:
     void ReportRuns(const std::vector<Run>& runs) override
     {
         for (const Run& run : runs) {
-            if (run.run_type != Run::RT_Iteration || run.error_occurred || run.iterations == 0)
+            if (run.run_type != Run::RT_Iteration || runSkipped(run, 0) || run.iterations == 0)
                 continue;
             const std::string name = run.run_name.function_name + "/" + run.run_name.args;
             const double seconds = run.cpu_accumulated_time / double(run.iterations);

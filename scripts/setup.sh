@@ -9,7 +9,7 @@ packages=(
     cmake ninja-build g++ pkg-config time
     qt6-base-dev libqt6sql6-sqlite qt6-httpserver-dev qt6-websockets-dev libutf8proc-dev
     libbenchmark-dev
-    clang-14 libclang-rt-14-dev
+    clang libclang-rt-dev
     help2man dpkg-dev lintian
     chromium
 )

@@ -11,6 +11,7 @@
 #include <QTcpSocket>
 #include <QTemporaryDir>
 #include <QThread>
+#include <QTimeZone>
 #include <QtEndian>
 #include <QtTest>
 
@@ -25,7 +26,7 @@ namespace {
 using AlarmFields = QMap<QString, QString>;
 using AlarmPredicate = std::function<bool(const AlarmFields&)>;
 
-const QDateTime kSeedEnd(QDate(2026, 11, 20), QTime(12, 0), Qt::UTC);
+const QDateTime kSeedEnd(QDate(2026, 11, 20), QTime(12, 0), QTimeZone::utc());
 
 // The alarm-list command as the plug-in writes it.
 QString queryCommand(const QString& filters = QString(), const QString& start = QString(),

@@ -4,10 +4,12 @@
 
 #include <AlarmListScanner.h>
 #include <AlarmXmlParser.h>
+#include <DomAttributeOrder.h>
 #include <XML2Json.h>
 #include <XmlHelper.h>
 
 #include <QDomDocument>
+#include <QLibraryInfo>
 #include <QXmlStreamReader>
 #include <QtTest>
 
@@ -255,6 +257,44 @@ private slots:
             else
                 QCOMPARE(written, savedByDom(node));
         }
+    }
+
+    // The running Qt's attribute order is found by asking its DOM, whichever Qt this was built
+    // against: Qt 6.4 writes attributes in its attribute hash's order, Qt 6.8 sorted by name.
+    void attributeOrderOfRunningQt()
+    {
+        using Rule = DomAttributeOrder::Rule;
+        const QVersionNumber qt = QLibraryInfo::version();
+        if (qt.majorVersion() == 6 && qt.minorVersion() == 4) {
+            QCOMPARE(DomAttributeOrder::forDocumentOrder(), Rule::Hash);
+            QCOMPARE(DomAttributeOrder::forItemOrder(), Rule::Given);
+        } else if (qt >= QVersionNumber(6, 8)) {
+            QCOMPARE(DomAttributeOrder::forDocumentOrder(), Rule::ByName);
+            QCOMPARE(DomAttributeOrder::forItemOrder(), Rule::ByName);
+        } else {
+            QSKIP("no known attribute order for this Qt");
+        }
+    }
+
+    void attributeOrderRule_data()
+    {
+        QTest::addColumn<QStringList>("saved");
+        QTest::addColumn<DomAttributeOrder::Rule>("rule");
+        QTest::newRow("by name") << QStringList{"B", "_c", "a", "a0"}
+                                 << DomAttributeOrder::Rule::ByName;
+        QTest::newRow("as given") << QStringList{"a0", "B", "a", "_c"}
+                                  << DomAttributeOrder::Rule::Given;
+        QTest::newRow("other") << QStringList{"a", "a0", "B", "_c"}
+                               << DomAttributeOrder::Rule::Unknown;
+        QTest::newRow("one missing")
+            << QStringList{"B", "_c", "a"} << DomAttributeOrder::Rule::Unknown;
+    }
+
+    void attributeOrderRule()
+    {
+        QFETCH(QStringList, saved);
+        QFETCH(DomAttributeOrder::Rule, rule);
+        QCOMPARE(DomAttributeOrder::ruleFor({"a0", "B", "a", "_c"}, saved, false), rule);
     }
 
     void nodeToXmlOfBuiltNodes()

@@ -30,7 +30,7 @@ std::optional<qint64> parseAlarmId(const QString& id)
 
 QString formatTime(qint64 secondsSinceEpoch)
 {
-    return QDateTime::fromSecsSinceEpoch(secondsSinceEpoch, Qt::UTC)
+    return QDateTime::fromSecsSinceEpoch(secondsSinceEpoch, QTimeZone::utc())
         .toString(QStringLiteral("yyyy-MM-ddTHH:mm:ss'Z'"));
 }
 

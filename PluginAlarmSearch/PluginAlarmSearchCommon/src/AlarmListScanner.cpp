@@ -1,5 +1,6 @@
 #include "AlarmListScanner.h"
 
+#include "DomAttributeOrder.h"
 #include "DomStyleWriter.h"
 
 #include <XML2Json.h>
@@ -394,7 +395,7 @@ private:
                 if (m_attributes[i].name == attribute.name)
                     return false;
             }
-            if (m_attributes.size() - first == MaxAttributes)
+            if (m_attributes.size() - first == maxAttributes())
                 return false;
             m_attributes.push_back(std::move(attribute));
         }
@@ -655,24 +656,29 @@ private:
             writer.endTag(node.name, level, isText(children.size() - 1));
     }
 
-    // In the DOM's order: that of its attribute hash, filled in document order.
+    // In the order the running Qt's DOM writes them.
     void writeAttributes(DomStyleWriter& writer, const Node& node)
     {
-        if (node.attributesEnd - node.attributesBegin < 2) {
-            for (qsizetype a = node.attributesBegin; a < node.attributesEnd; ++a)
-                writer.attribute(m_attributes[std::size_t(a)].name,
-                                 m_attributes[std::size_t(a)].value);
-            return;
-        }
-        QHash<QString, qsizetype> hashOrder;
+        DomAttributeOrder::Names names;
         for (qsizetype a = node.attributesBegin; a < node.attributesEnd; ++a)
-            hashOrder.insert(m_attributes[std::size_t(a)].name.toString(), a);
-        for (auto it = hashOrder.cbegin(); it != hashOrder.cend(); ++it)
-            writer.attribute(it.key(), m_attributes[std::size_t(it.value())].value);
+            names.append(m_attributes[std::size_t(a)].name);
+        for (const qsizetype i : DomAttributeOrder::arrange(m_attributeOrder, names)) {
+            const Attribute& attribute = m_attributes[std::size_t(node.attributesBegin + i)];
+            writer.attribute(attribute.name, attribute.value);
+        }
+    }
+
+    // Where the DOM's attribute order cannot be reproduced, elements with several attributes
+    // are left to the general route.
+    std::size_t maxAttributes() const
+    {
+        return m_attributeOrder == DomAttributeOrder::Rule::Unknown ? 1
+                                                                    : std::size_t(MaxAttributes);
     }
 
     const char16_t* m_pos;
     const char16_t* const m_end;
+    const DomAttributeOrder::Rule m_attributeOrder = DomAttributeOrder::forDocumentOrder();
 
     // The alarm being read.
     std::vector<Node> m_nodes;

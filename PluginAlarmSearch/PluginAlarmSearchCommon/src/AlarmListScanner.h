@@ -13,7 +13,8 @@
 // - text and attribute values of characters XML allows, with the five predefined entities and
 //   character references (in text not to control characters); no raw carriage returns;
 // - no comments, processing instructions, CDATA sections or document type declaration;
-// - nesting up to XML2Json::MaxDepth, up to 32 attributes per element.
+// - nesting up to XML2Json::MaxDepth, up to 32 attributes per element (one where the running
+//   Qt's DOM orders attributes in a way DomAttributeOrder cannot reproduce).
 // Anything else gives nothing, also text that is not well-formed, and the caller takes the
 // general route.
 class AlarmListScanner

@@ -1,8 +1,10 @@
 #include "XmlHelper.h"
 
+#include "DomAttributeOrder.h"
 #include "DomStyleWriter.h"
 
 #include <QTextStream>
+#include <QVarLengthArray>
 
 namespace {
 
@@ -94,16 +96,37 @@ private:
         if (!element.namespaceURI().isNull() || attributes.count() > MaxIndexedAttributes)
             return false;
         m_writer.openStartTag(element.tagName(), level, afterText);
-        for (int i = 0; i < attributes.count(); ++i) {
-            const QDomAttr attribute = attributes.item(i).toAttr();
-            if (!attribute.namespaceURI().isNull())
-                return false;
-            m_writer.attribute(attribute.name(), attribute.value());
-        }
+        if (!writeAttributes(attributes))
+            return false;
         const bool hasChildren = element.hasChildNodes();
         m_writer.closeStartTag(hasChildren, isTextNode(element.firstChild()));
         if (!hasChildren)
             m_writer.lineBreak(beforeText);
+        return true;
+    }
+
+    // In the order the running Qt's QDomNode::save writes them; false for a namespace or an
+    // order this writer cannot reproduce.
+    bool writeAttributes(const QDomNamedNodeMap& attributes)
+    {
+        QVarLengthArray<QString, 32> nameTexts;
+        QVarLengthArray<QString, 32> values;
+        for (int i = 0; i < attributes.count(); ++i) {
+            const QDomAttr attribute = attributes.item(i).toAttr();
+            if (!attribute.namespaceURI().isNull())
+                return false;
+            nameTexts.append(attribute.name());
+            values.append(attribute.value());
+        }
+        DomAttributeOrder::Names names; // views of nameTexts, which no longer grows
+        for (const QString& name : nameTexts)
+            names.append(name);
+        const DomAttributeOrder::Positions positions =
+            DomAttributeOrder::arrange(m_attributeOrder, names);
+        if (positions.size() != names.size())
+            return false;
+        for (const qsizetype i : positions)
+            m_writer.attribute(nameTexts[i], values[i]);
         return true;
     }
 
@@ -114,6 +137,7 @@ private:
     }
 
     DomStyleWriter m_writer;
+    const DomAttributeOrder::Rule m_attributeOrder = DomAttributeOrder::forItemOrder();
 };
 
 // Whether the subtree below node is no deeper than XmlHelper::MaxDepth, found without recursion.
