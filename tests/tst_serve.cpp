@@ -26,6 +26,7 @@ struct Reply
 {
     int status = 0;
     QJsonObject body;
+    QByteArray contentSecurityPolicy;
 };
 
 // A running `alarmsearch serve`, stopped with SIGTERM.
@@ -82,7 +83,8 @@ Reply request(const QUrl& base, const QByteArray& verb, const QString& path,
     QObject::connect(reply, &QNetworkReply::finished, &loop, &QEventLoop::quit);
     loop.exec();
     Reply result{reply->attribute(QNetworkRequest::HttpStatusCodeAttribute).toInt(),
-                 QJsonDocument::fromJson(reply->readAll()).object()};
+                 QJsonDocument::fromJson(reply->readAll()).object(),
+                 reply->rawHeader("Content-Security-Policy")};
     delete reply;
     return result;
 }
@@ -193,6 +195,8 @@ private slots:
         QFETCH(QString, field);
         const Reply reply = request(m_server->url, verb, path, body);
         QCOMPARE(reply.status, status);
+        // Every answer, also one past the routes, keeps a browser from running inline scripts.
+        QVERIFY(reply.contentSecurityPolicy.contains("script-src 'self'"));
         if (status == 400 || status == 413)
             QCOMPARE(reply.body.value(QLatin1String("field")).toString(), field);
         else

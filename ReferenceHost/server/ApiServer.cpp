@@ -228,8 +228,11 @@ void ApiServer::addRoutes()
                                   "websocket")
                                   return;
                               qCInfo(lcServe).noquote() << "GET" << request.url().path() << 426;
-                              responder.write(upgradeRequired(), "application/json",
-                                              QHttpServerResponder::StatusCode(426));
+                              QHttpServerResponse response(QByteArrayLiteral("application/json"),
+                                                           upgradeRequired(),
+                                                           QHttpServerResponse::StatusCode(426));
+                              ConsolePages::addSecurityHeaders(response);
+                              response.write(std::move(responder));
                           });
             continue;
         }
@@ -248,11 +251,18 @@ void ApiServer::addRoutes()
 
     const auto notFound = [](const QHttpServerRequest& request, auto&& responder) {
         qCInfo(lcServe).noquote() << request.url().path() << 404;
-        responder.write(
+        QHttpServerResponse response(
+            QByteArrayLiteral("application/json"),
             QJsonDocument(QJsonObject{{QStringLiteral("error"), QStringLiteral("not found")},
                                       {QStringLiteral("path"), request.url().path()}})
                 .toJson(QJsonDocument::Compact),
-            "application/json", QHttpServerResponder::StatusCode::NotFound);
+            QHttpServerResponse::StatusCode::NotFound);
+        ConsolePages::addSecurityHeaders(response);
+#if QT_VERSION >= QT_VERSION_CHECK(6, 8, 0)
+        responder.sendResponse(response);
+#else
+        response.write(std::move(responder));
+#endif
     };
 #if QT_VERSION >= QT_VERSION_CHECK(6, 8, 0)
     m_http->setMissingHandler(

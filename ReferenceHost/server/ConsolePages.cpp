@@ -35,12 +35,6 @@ void setHeader(QHttpServerResponse& response, const QByteArray& name, const QByt
 #endif
 }
 
-void addSecurityHeaders(QHttpServerResponse& response)
-{
-    for (const Header& header : kSecurityHeaders)
-        setHeader(response, header.first, header.second);
-}
-
 QByteArray mimeTypeOf(const QString& name)
 {
     if (name.endsWith(QLatin1String(".html")))
@@ -69,6 +63,20 @@ QHttpServerResponse consoleFile(const QString& name)
 }
 
 } // namespace
+
+void ConsolePages::addSecurityHeaders(QHttpServerResponse& response)
+{
+    for (const Header& header : kSecurityHeaders)
+        setHeader(response, header.first, header.second);
+}
+
+QByteArray ConsolePages::securityHeaderLines()
+{
+    QByteArray lines;
+    for (const Header& header : kSecurityHeaders)
+        lines += QByteArray(header.first) + ": " + header.second + "\r\n";
+    return lines;
+}
 
 void ConsolePages::addRoutes(QHttpServer& http, QObject* context)
 {

@@ -1,6 +1,9 @@
 #pragma once
 
+#include <QByteArray>
+
 class QHttpServer;
+class QHttpServerResponse;
 class QObject;
 
 // The operator console: its page at "/" and its style sheet and script modules at
@@ -10,5 +13,9 @@ class QObject;
 namespace ConsolePages {
 
 void addRoutes(QHttpServer& http, QObject* context);
+// For responses written past the routes (the missing handler's).
+void addSecurityHeaders(QHttpServerResponse& response);
+// The same headers as lines of a response written by hand, each ending in CR LF.
+QByteArray securityHeaderLines();
 
 } // namespace ConsolePages

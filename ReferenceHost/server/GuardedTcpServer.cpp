@@ -1,6 +1,7 @@
 #include "GuardedTcpServer.h"
 
 #include "ApiServer.h"
+#include "ConsolePages.h"
 
 #include <QJsonDocument>
 #include <QJsonObject>
@@ -112,12 +113,12 @@ private:
                 .toJson(QJsonDocument::Compact);
         m_socket->readAll();
         m_socket->write(QStringLiteral("HTTP/1.1 %1 %2\r\nContent-Type: application/json\r\n"
-                                       "Content-Length: %3\r\nConnection: close\r\n\r\n")
+                                       "Content-Length: %3\r\nConnection: close\r\n")
                             .arg(status)
                             .arg(reason)
                             .arg(body.size())
                             .toLatin1() +
-                        body);
+                        ConsolePages::securityHeaderLines() + "\r\n" + body);
         // Closing while the client still sends would reset the connection and lose the answer:
         // the rest of the request is read and dropped for a while first.
         QTimer::singleShot(kRefusalLingerMs, m_socket, &QTcpSocket::disconnectFromHost);
