@@ -63,7 +63,13 @@ int main(int argc, char* argv[])
         QStringLiteral("seed-count"),
         QStringLiteral("Demo alarms seeded into a new database (default: 30000)."),
         QStringLiteral("count"), QStringLiteral("30000"));
-    parser.addOptions({dbOption, memoryOption, portOption, seedCountOption});
+    const QCommandLineOption maxConnectionsOption(
+        QStringLiteral("max-connections"),
+        QStringLiteral("Clients served at once; more are closed at once (default: %1).")
+            .arg(AlarmServerSim::TcpAlarmServer::DefaultMaxConnections),
+        QStringLiteral("count"),
+        QString::number(AlarmServerSim::TcpAlarmServer::DefaultMaxConnections));
+    parser.addOptions({dbOption, memoryOption, portOption, seedCountOption, maxConnectionsOption});
     parser.process(app);
 
     bool portOk = false;
@@ -71,8 +77,10 @@ int main(int argc, char* argv[])
     bool countOk = false;
     AlarmServerSim::AlarmServer::Options options;
     options.seedCount = parser.value(seedCountOption).toInt(&countOk);
-    if (!portOk || port > 65535 || !countOk || options.seedCount < 0 ||
-        (parser.isSet(dbOption) && parser.isSet(memoryOption))) {
+    bool connectionsOk = false;
+    const int maxConnections = parser.value(maxConnectionsOption).toInt(&connectionsOk);
+    if (!portOk || port > 65535 || !countOk || options.seedCount < 0 || !connectionsOk ||
+        maxConnections < 1 || (parser.isSet(dbOption) && parser.isSet(memoryOption))) {
         std::fprintf(stderr, "%s\n", qPrintable(parser.helpText()));
         return 2;
     }
@@ -89,6 +97,7 @@ int main(int argc, char* argv[])
         return 1;
     }
     AlarmServerSim::TcpAlarmServer tcpServer(server);
+    tcpServer.setMaxConnections(maxConnections);
     if (!tcpServer.listenOnLoopback(quint16(port))) {
         std::fprintf(stderr, "cannot listen on 127.0.0.1:%u: %s\n", port,
                      qPrintable(tcpServer.errorString()));
