@@ -3,6 +3,7 @@
 #include <QVarLengthArray>
 
 #include <algorithm>
+#include <iterator>
 #include <map>
 #include <numeric>
 
@@ -19,11 +20,12 @@ QVariant AlarmMapBuilder::render(const AlarmSubtree& subtree, qsizetype index)
     if (m_keys.empty()) {
         m_keys.push_back(TextKey);
         m_keyRanks.push_back(0);
+        m_rankedKeys.push_back(0);
     }
-    // New keys are ranked once they are as many as half the ranked ones: the sort costs time
-    // in proportion to all keys, and each key pays for it once, however many distinct names a
-    // reply brings.
-    if (2 * m_unranked >= m_keys.size() - m_unranked && m_unranked > 0)
+    // New keys are ranked once they are as many as half the ranked ones: ranking takes time in
+    // proportion to all keys, so each key pays a constant share of it, however many distinct
+    // names a reply brings.
+    if (!m_unrankedKeys.empty() && 2 * m_unrankedKeys.size() >= m_rankedKeys.size())
         rankNewKeys();
     return renderNode(subtree, index);
 }
@@ -101,19 +103,26 @@ int AlarmMapBuilder::keyId(QStringView name, QHash<QStringView, int>& cache, QSt
     key.reserve(prefix.size() + name.size());
     m_keys.push_back(key.append(prefix).append(name));
     m_keyRanks.push_back(Unranked);
-    ++m_unranked;
+    m_unrankedKeys.push_back(id);
     cache.insert(name, id);
     return id;
 }
 
+// Sorts the new keys and merges them into the ranked ones.
 void AlarmMapBuilder::rankNewKeys()
 {
-    std::vector<int> order(m_keys.size());
-    std::iota(order.begin(), order.end(), 0);
-    std::sort(order.begin(), order.end(), [&](int a, int b) { return m_keys[a] < m_keys[b]; });
+    const auto byText = [this](int a, int b) {
+        return m_keys[std::size_t(a)] < m_keys[std::size_t(b)];
+    };
+    std::sort(m_unrankedKeys.begin(), m_unrankedKeys.end(), byText);
+    std::vector<int> order;
+    order.reserve(m_rankedKeys.size() + m_unrankedKeys.size());
+    std::merge(m_rankedKeys.cbegin(), m_rankedKeys.cend(), m_unrankedKeys.cbegin(),
+               m_unrankedKeys.cend(), std::back_inserter(order), byText);
     for (std::size_t rank = 0; rank < order.size(); ++rank)
         m_keyRanks[std::size_t(order[rank])] = int(rank);
-    m_unranked = 0;
+    m_rankedKeys = std::move(order);
+    m_unrankedKeys.clear();
 }
 
 // The order of QVariantMap keys: by rank where both are ranked, which is the order of their

@@ -33,7 +33,8 @@ private:
     // Each key's place in the order of a QVariantMap, or Unranked for keys that turned up after
     // the last ranking; those are compared by their text.
     std::vector<int> m_keyRanks;
-    std::size_t m_unranked = 0;
+    std::vector<int> m_rankedKeys;         // in the order of their texts
+    std::vector<int> m_unrankedKeys;       // in the order they turned up
     QHash<QStringView, int> m_elementKeys; // keys view the reply text
     QHash<QStringView, int> m_attributeKeys;
 };

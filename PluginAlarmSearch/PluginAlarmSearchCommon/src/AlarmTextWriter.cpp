@@ -39,9 +39,10 @@ void AlarmTextWriter::writeAttributes(const AlarmSubtree& subtree, const Subtree
             m_writer.attribute(subtree.attribute(a).name, subtree.attribute(a).value);
         return;
     }
-    QHash<QString, qsizetype> hashOrder;
+    // Keyed by views: qHash of a view equals that of the string, so the order is the same.
+    QHash<QStringView, qsizetype> hashOrder;
     for (qsizetype a = node.attributesBegin; a < node.attributesEnd; ++a)
-        hashOrder.insert(subtree.attribute(a).name.toString(), a);
+        hashOrder.insert(subtree.attribute(a).name, a);
     for (auto it = hashOrder.cbegin(); it != hashOrder.cend(); ++it)
         m_writer.attribute(it.key(), subtree.attribute(it.value()).value);
 }

@@ -48,7 +48,9 @@ bool isPlain(char16_t c)
 {
     if (c < 0x80)
         return AsciiClass[c] == Ascii::Plain;
-    return (c < 0xD800 || (c >= 0xE000 && c < 0xFFFE)) && !QChar::isSpace(c);
+    if (c < 0x1680) // the common letters of most scripts; no spaces here but two
+        return c != 0x85 && c != 0xA0;
+    return (c < 0xD800 || (c >= 0xE000 && c < 0xFFFE)) && (c > 0x3000 || !QChar::isSpace(c));
 }
 
 // Characters XML allows, the white space controls only where asked for (in text, references to
@@ -286,7 +288,11 @@ bool ReplyTokenizer::attributeValue(QString& value)
             ++m_pos;
         }
     }
-    flush();
+    // A value written as it reads is shared with its repeats (ids of kinds, zones, flags).
+    if (value.isNull())
+        value = interned(QStringView(plainFrom, m_pos));
+    else
+        flush();
     ++m_pos;
     if (value.isNull())
         value = EmptyText;
