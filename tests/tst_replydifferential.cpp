@@ -93,6 +93,10 @@ private slots:
 
         scanner("generated 60 alarms", AlarmReplies::reply(60));
         scanner("one alarm, no white space", wrap(AlarmReplies::alarm(4)));
+        for (AlarmReplies::Shape shape : AlarmReplies::Shapes)
+            scanner(AlarmReplies::shapeName(shape), AlarmReplies::shapedReply(shape, 8));
+        scanner("distinct names, ranked as they come",
+                AlarmReplies::shapedReply(AlarmReplies::Shape::DistinctNames, 100));
         scanner("indented alarms",
                 "<QryAlarmListRes>\n  <Total>2</Total>\n  <Alarm>\n    <AlarmID>1</AlarmID>\n"
                 "    <Note/>\n  </Alarm>\n  <Alarm>\n    <AlarmID>2</AlarmID>\n  </Alarm>\n"
