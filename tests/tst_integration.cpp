@@ -1,4 +1,5 @@
 #include <AlarmPager.h>
+#include <AlarmSearchLimits.h>
 #include <AnswerFormat.h>
 #include <HostSession.h>
 #include <HostTunnelClient.h>
@@ -408,6 +409,10 @@ private slots:
             << memory + QStringList{QStringLiteral("batch")}
             << QByteArray("{\"method\":\"QryAlarmList\",\"args\":{}}\n{\"method\": oops}\n") << 2
             << "line 2: bad JSON";
+        QTest::newRow("batch line past the bound")
+            << memory + QStringList{QStringLiteral("batch")}
+            << QByteArray(AlarmSearchLimits::MaxRequestLineBytes + 1, ' ') + '\n'
+            << 2 << "line 1: longer than";
         QTest::newRow("unknown batch method")
             << memory + QStringList{QStringLiteral("batch")}
             << QByteArray("{\"method\":\"ProcessAlarm\"}\n") << 2 << "line 1: \"method\" must be";

@@ -1,6 +1,8 @@
 #include "Cli.h"
 #include "Commands.h"
 
+#include <AlarmSearchLimits.h>
+
 #include <AnswerFormat.h>
 #include <HostTunnelClient.h>
 
@@ -118,7 +120,12 @@ int batch(Cli& cli, const QStringList& arguments)
         return cli.fail(QStringLiteral("cannot read standard input"));
     bool allOk = true;
     for (int lineNumber = 1; !input.atEnd(); ++lineNumber) {
-        const QByteArray line = input.readLine().trimmed();
+        QByteArray line = input.readLine(AlarmSearchLimits::MaxRequestLineBytes + 2);
+        if (line.size() > AlarmSearchLimits::MaxRequestLineBytes)
+            return cli.usageError(QStringLiteral("line %1: longer than %2 bytes")
+                                      .arg(lineNumber)
+                                      .arg(AlarmSearchLimits::MaxRequestLineBytes));
+        line = line.trimmed();
         if (line.isEmpty())
             continue;
         QJsonParseError parseError;

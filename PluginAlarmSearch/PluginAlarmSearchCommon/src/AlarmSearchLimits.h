@@ -38,4 +38,8 @@ constexpr int MaxAttributes = 64;
 // units. A filter of every event class of a system is a few KiB.
 constexpr qsizetype MaxFragmentLength = qsizetype(1024) * 1024;
 
+// Longest line of requests the command-line client's batch reads, in bytes; a line holds one
+// request, its filters within MaxFragmentLength each.
+constexpr qsizetype MaxRequestLineBytes = qsizetype(16) * 1024 * 1024;
+
 } // namespace AlarmSearchLimits
