@@ -146,6 +146,9 @@ private slots:
             << 1 << true;
         QTest::newRow("one alarm more")
             << reply(QStringLiteral("<Alarm/>").repeated(MaxReplyAlarms + 1)) << -1 << 0 << true;
+        QTest::newRow("one alarm more under another root")
+            << "<R>" + QStringLiteral("<Alarm/>").repeated(MaxReplyAlarms + 1) + "</R>" << -1 << 0
+            << true;
         QTest::newRow("elements at the bound")
             << reply(QStringLiteral("<A/>").repeated(MaxReplyElements - 1)) << 0 << 0 << true;
         QTest::newRow("one element more")

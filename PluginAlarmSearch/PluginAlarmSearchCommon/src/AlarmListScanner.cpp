@@ -61,9 +61,11 @@ private:
                 return false;
             if (next == ReplyTokenizer::Markup::EndTag)
                 break;
-            const bool isAlarm = isReply && m_tokens.peekName() == AlarmName;
-            if (isAlarm && m_alarms.size() == AlarmSearchLimits::MaxReplyAlarms)
+            // Alarms are counted under any document element, as the general route counts them.
+            const bool namedAlarm = m_tokens.peekName() == AlarmName;
+            if (namedAlarm && ++m_alarmChildren > AlarmSearchLimits::MaxReplyAlarms)
                 return false;
+            const bool isAlarm = isReply && namedAlarm;
             if (!m_subtree.capture(m_tokens, 2, isAlarm))
                 return false;
             if (isAlarm)
@@ -107,6 +109,7 @@ private:
     QVariantMap m_alarm;
     Utf16Buffer m_xml;
     bool m_alarmPending = false;
+    qsizetype m_alarmChildren = 0;
 };
 
 } // namespace
