@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <iterator>
 #include <map>
-#include <numeric>
 
 namespace {
 
@@ -63,27 +62,39 @@ QVariant AlarmMapBuilder::renderNode(const AlarmSubtree& subtree, qsizetype inde
     if (!text.isEmpty())
         entries.append({0, std::move(text)}); // "#text" is the first key
 
-    QVarLengthArray<int, 32> order(entries.size());
-    std::iota(order.begin(), order.end(), 0);
-    std::sort(order.begin(), order.end(), [&](int a, int b) {
-        const int keyA = entries[a].key;
-        const int keyB = entries[b].key;
-        return keyA == keyB ? a < b : keyLess(keyA, keyB);
-    });
+    // Positions ordered by key, ties in document order: by rank where every key has one (the
+    // common case, compared as numbers), else by the keys' texts.
+    QVarLengthArray<std::pair<int, int>, 32> order;
+    bool allRanked = true;
+    for (int i = 0; i < int(entries.size()); ++i) {
+        const int rank = m_keyRanks[std::size_t(entries[i].key)];
+        allRanked = allRanked && rank != Unranked;
+        order.append({rank, i});
+    }
+    if (allRanked) {
+        std::sort(order.begin(), order.end());
+    } else {
+        std::sort(order.begin(), order.end(), [&](const auto& a, const auto& b) {
+            const int keyA = entries[a.second].key;
+            const int keyB = entries[b.second].key;
+            return keyA == keyB ? a.second < b.second : keyLess(keyA, keyB);
+        });
+    }
 
     std::map<QString, QVariant> content;
     for (auto it = order.cbegin(); it != order.cend();) {
-        const int key = entries[*it].key;
-        const auto next = std::find_if(it + 1, order.cend(),
-                                       [&](int position) { return entries[position].key != key; });
+        const int key = entries[it->second].key;
+        const auto next = std::find_if(it + 1, order.cend(), [&](const auto& position) {
+            return entries[position.second].key != key;
+        });
         QVariant value;
         if (next - it == 1) {
-            value = std::move(entries[*it].value);
+            value = std::move(entries[it->second].value);
         } else {
             QVariantList repeated;
             repeated.reserve(next - it);
             for (auto same = it; same != next; ++same)
-                repeated.append(std::move(entries[*same].value));
+                repeated.append(std::move(entries[same->second].value));
             value = std::move(repeated);
         }
         content.emplace_hint(content.cend(), m_keys[std::size_t(key)], std::move(value));
