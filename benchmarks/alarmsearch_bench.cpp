@@ -18,8 +18,10 @@
 
 #include <algorithm>
 #include <cstdio>
+#include <iterator>
 #include <map>
 #include <string>
+#include <utility>
 
 using namespace PluginAlarmSearchCommon;
 
@@ -131,6 +133,97 @@ void BM_AnswerFloor(benchmark::State& state)
     setAlarmCounters(state);
 }
 BENCHMARK(BM_AnswerFloor)->Apply(sizes);
+
+// Replies of other shapes, 5000 alarms each; the argument is the shape's place in
+// AlarmReplies::Shapes.
+constexpr int ShapedAlarms = 5000;
+
+const QString& shapedReplyOf(AlarmReplies::Shape shape, int alarms)
+{
+    static std::map<std::pair<AlarmReplies::Shape, int>, QString> replies;
+    auto it = replies.find({shape, alarms});
+    if (it == replies.end())
+        it = replies.emplace(std::pair(shape, alarms), AlarmReplies::shapedReply(shape, alarms))
+                 .first;
+    return it->second;
+}
+
+void shapes(benchmark::internal::Benchmark* benchmark)
+{
+    for (std::size_t i = 0; i < std::size(AlarmReplies::Shapes); ++i)
+        benchmark->Arg(int64_t(i));
+    benchmark->Unit(benchmark::kMillisecond);
+}
+
+void BM_ShapeBareStreamReader(benchmark::State& state)
+{
+    const QString& reply = shapedReplyOf(AlarmReplies::Shapes[state.range(0)], ShapedAlarms);
+    for (auto _ : state) {
+        QXmlStreamReader reader(reply);
+        while (!reader.atEnd())
+            reader.readNext();
+        benchmark::DoNotOptimize(reader.hasError());
+    }
+}
+BENCHMARK(BM_ShapeBareStreamReader)->Apply(shapes);
+
+void BM_ShapeRead(benchmark::State& state)
+{
+    const QString& reply = shapedReplyOf(AlarmReplies::Shapes[state.range(0)], ShapedAlarms);
+    for (auto _ : state) {
+        if (readReply(reply) != ShapedAlarms)
+            state.SkipWithError("the reply was not read whole");
+    }
+}
+BENCHMARK(BM_ShapeRead)->Apply(shapes);
+
+// Every alarm brings a field name no other alarm has: the cost per alarm must not grow with
+// the number of names seen.
+void BM_DistinctNamesRead(benchmark::State& state)
+{
+    const QString& reply = shapedReplyOf(AlarmReplies::Shape::DistinctNames, int(state.range(0)));
+    for (auto _ : state) {
+        if (readReply(reply) != state.range(0))
+            state.SkipWithError("the reply was not read whole");
+    }
+}
+BENCHMARK(BM_DistinctNamesRead)->Arg(500)->Arg(5000)->Unit(benchmark::kMillisecond);
+
+// Replies that held a reply thread for seconds or took gigabytes before they were bounded,
+// read once each: one alarm with 32 000 distinct child names, one with 80 000 attributes, and
+// 8.39 million empty alarms just within the length bound.
+enum Hostile { ManyNames, ManyAttributes, ManyAlarms };
+
+QString hostileReply(int kind)
+{
+    QString xml = QStringLiteral("<QryAlarmListRes><Alarm");
+    if (kind == ManyNames) {
+        xml += u'>';
+        for (int i = 0; i < 32000; ++i)
+            xml += QStringLiteral("<n%1/>").arg(i);
+        xml += QStringLiteral("</Alarm>");
+    } else if (kind == ManyAttributes) {
+        for (int i = 0; i < 80000; ++i)
+            xml += QStringLiteral(" a%1=''").arg(i);
+        xml += QStringLiteral("/>");
+    } else {
+        xml += QStringLiteral("/>") + QStringLiteral("<Alarm/>").repeated(8388000 - 1);
+    }
+    return xml + QStringLiteral("</QryAlarmListRes>");
+}
+
+void BM_HostileReply(benchmark::State& state)
+{
+    const QString reply = hostileReply(int(state.range(0)));
+    for (auto _ : state)
+        benchmark::DoNotOptimize(readReply(reply));
+}
+BENCHMARK(BM_HostileReply)
+    ->Arg(ManyNames)
+    ->Arg(ManyAttributes)
+    ->Arg(ManyAlarms)
+    ->Iterations(1)
+    ->Unit(benchmark::kMillisecond);
 
 void BM_GetAlarmList(benchmark::State& state)
 {
@@ -322,6 +415,33 @@ int main(int argc, char** argv)
             std::printf("%s per alarm, 500 -> 50000: %.2f -> %.2f us (%.2fx, +%.2f us)\n",
                         benchmark, small, large, large / small, large - small);
     }
+    for (std::size_t i = 0; i < std::size(AlarmReplies::Shapes); ++i) {
+        const std::string arg = std::to_string(i);
+        const double bare = reporter.fastest("BM_ShapeBareStreamReader/" + arg);
+        const double read = reporter.fastest("BM_ShapeRead/" + arg);
+        if (read > 0 && bare > 0)
+            std::printf("reply-read ratio 5000, %s: %.2f (target <= 1.00; %.2f us per alarm)\n",
+                        AlarmReplies::shapeName(AlarmReplies::Shapes[i]), read / bare,
+                        read * 1e6 / ShapedAlarms);
+    }
+    const double distinctSmall = perAlarm("BM_DistinctNamesRead", "500");
+    const double distinctLarge = perAlarm("BM_DistinctNamesRead", "5000");
+    if (distinctSmall > 0 && distinctLarge > 0)
+        std::printf("a distinct name per alarm, per alarm, 500 -> 5000: %.2f -> %.2f us (%.2fx, "
+                    "target: no growth)\n",
+                    distinctSmall, distinctLarge, distinctLarge / distinctSmall);
+    const char* const hostileNames[] = {"one alarm of 32000 distinct names (read)",
+                                        "one alarm of 80000 attributes (refused)",
+                                        "8.39 million empty alarms (refused)"};
+    for (int kind : {ManyNames, ManyAttributes, ManyAlarms}) {
+        const double seconds = reporter.fastest("BM_HostileReply/" + std::to_string(kind));
+        if (seconds > 0)
+            std::printf("hostile reply, %s: %.0f ms\n", hostileNames[kind], seconds * 1e3);
+    }
+    if (reporter.fastest("BM_HostileReply/" + std::to_string(ManyAlarms)) > 0)
+        std::printf("hostile reply, 8.39 million empty alarms: peak memory %ld KiB over the "
+                    "reply\n",
+                    peakExtraKiB(hostileReply(ManyAlarms)));
     const double replyKiB = double(memoryReply.size()) * sizeof(QChar) / 1024;
     std::printf("peak memory of one 5000-alarm read: %ld KiB over a reply of %.0f KiB "
                 "(UTF-16), %.2fx\n",

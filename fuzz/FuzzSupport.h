@@ -20,9 +20,12 @@ inline QString fuzzedText(FuzzedDataProvider& input, bool utf16)
 }
 
 // Aborts unless xml is one well-formed element named root, without an XML declaration: what the
-// server is sent must always be readable, whatever the client put into its request.
-inline void requireWellFormed(const QString& xml, const QString& root)
+// server is sent must always be readable, whatever the client put into its request. An empty
+// text is the composer's refusal, allowed only where refusable says the request may be refused.
+inline void requireWellFormed(const QString& xml, const QString& root, bool refusable = false)
 {
+    if (xml.isEmpty() && refusable)
+        return;
     QXmlStreamReader reader(xml);
     reader.setNamespaceProcessing(false);
     QString firstElement;

@@ -1,7 +1,9 @@
 #include "FuzzSupport.h"
 
+#include <AlarmSearchLimits.h>
 #include <MessageComposer.h>
 #include <PluginAlarmSearchCommon.h>
+#include <XmlHelper.h>
 
 using namespace PluginAlarmSearchCommon;
 
@@ -28,7 +30,15 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size)
     }
     request.insert(ARG_RULES, rules);
 
+    // Refused only for a filter fragment that may not be built into a DOM.
+    const auto fragmentFits = [](const QString& fragment) {
+        return XmlHelper::safeForDom(fragment, AlarmSearchLimits::MaxFragmentLength);
+    };
+    const bool refusable =
+        !fragmentFits(QStringLiteral("<TriggerEventList>%1</TriggerEventList>")
+                          .arg(request.value(ARG_TRIGGER_EVENT_FILTER).toString())) ||
+        !fragmentFits(request.value(ARG_STATE_FILTER).toString());
     requireWellFormed(MessageComposer().composeQueryAlarmListMessage(request),
-                      QStringLiteral("QryAlarmList"));
+                      QStringLiteral("QryAlarmList"), refusable);
     return 0;
 }

@@ -225,6 +225,30 @@ private slots:
                    return a["DeviceName"] == "Lobby Entrance" ||
                           a["DeviceName"] == "Recording Server 01";
                });
+        // Each list is one bound value: SQLite refused 1000 or more parameters.
+        const auto many = [](const char* list, const char* item, const QString& last) {
+            QString items;
+            for (int i = 0; i < 5000; ++i)
+                items += QStringLiteral("<%1>none %2</%1>").arg(QLatin1String(item)).arg(i);
+            return QStringLiteral("<TriggerEventList/><%1>%2<%3>%4</%3></%1>")
+                .arg(QLatin1String(list), items, QLatin1String(item), last);
+        };
+        QTest::newRow("5001 device names")
+            << many("TriggerDeviceNameList", "DeviceName", "Lobby Entrance") << ""
+            << "" << AlarmPredicate([](const AlarmFields& a) {
+                   return a["DeviceName"] == "Lobby Entrance";
+               });
+        QTest::newRow("5001 names") << many("NameList", "Name", "Loitering") << ""
+                                    << "" << AlarmPredicate([](const AlarmFields& a) {
+                                           return a["AlarmName"].contains("Loitering");
+                                       });
+        QTest::newRow("5001 events")
+            << events(QStringLiteral("<Event>None</Event>").repeated(5000) +
+                      "<Event CameraEvent=\"Motion\">CamEvent</Event>")
+            << ""
+            << "" << AlarmPredicate([](const AlarmFields& a) {
+                   return a["EventClass"] == "CamEvent" && a["SubEvent"] == "Motion";
+               });
         QTest::newRow("time bound, both ends inclusive")
             << "" << m_all.at(300)["ServerTime"].chopped(1) << m_all.at(100)["ServerTime"]
             << AlarmPredicate([this](const AlarmFields& a) {
@@ -420,6 +444,21 @@ private slots:
         QTest::newRow("mute flag")
             << "MuteAlarm" << muteCommand({"A0000001"}, true, 5).replace(">true<", ">yes<")
             << "80000001";
+        // The parsed tree's destructor recursed once per level: 400 000 levels crashed.
+        QTest::newRow("nested 257 levels")
+            << "GetAlarmInfo"
+            << "<GetAlarmInfo>" + QStringLiteral("<e>").repeated(256) +
+                   QStringLiteral("</e>").repeated(256) + "</GetAlarmInfo>"
+            << "80000001";
+        QTest::newRow("nested 400000 levels")
+            << "QryAlarmList"
+            << "<QryAlarmList><Filters>" + QStringLiteral("<e>").repeated(400000) << "80000001";
+        QString attributes;
+        for (int i = 0; i < 80000; ++i)
+            attributes += QStringLiteral(" a%1=''").arg(i);
+        QTest::newRow("80000 attributes") << "GetAlarmInfo"
+                                          << "<GetAlarmInfo" + attributes + "/>"
+                                          << "80000001";
         QTest::newRow("unknown method") << "QryAlarms" << queryCommand() << "80000002";
         QTest::newRow("method in another case") << "qryalarmlist" << queryCommand() << "80000002";
     }
@@ -594,6 +633,65 @@ private slots:
             QStringLiteral("<GetAlarmInfoRes><Alarm><AlarmID>%1</AlarmID>").arg(id)));
         QCOMPARE(replies.at(2).value("id").toInt(), 4);
         QCOMPARE(replies.at(2).value("status").toString(), QStringLiteral("80000002"));
+    }
+
+    // A client that sends without reading: the server stops taking its requests while their
+    // replies wait unsent, so the client's writes back up instead of the server's memory
+    // growing (844 MB after 400 pipelined queries of 5000 alarms); once it reads, every reply
+    // comes, in order.
+    void pipelinedWithoutReading()
+    {
+        TcpAlarmServer tcp(*m_server);
+        QVERIFY(tcp.listenOnLoopback(0));
+        QTcpSocket socket;
+        socket.connectToHost(QHostAddress::LocalHost, tcp.serverPort());
+        QVERIFY(socket.waitForConnected(5000));
+        const QString padding(20000, u' ');
+        const int queries = 200;
+        const int requests = queries + 2000;
+        for (int id = 0; id < requests; ++id) {
+            const QString command =
+                id < queries ? queryCommand() : "<GetAlarmInfo>" + padding + "</GetAlarmInfo>";
+            socket.write(encodeFrame({{"id", id},
+                                      {"method", id < queries ? "QryAlarmList" : "GetAlarmInfo"},
+                                      {"command", command}}));
+        }
+        QTest::qWait(2000);
+        QVERIFY2(socket.bytesToWrite() > 0, "the server read every request");
+
+        QByteArray buffer;
+        QList<QJsonObject> replies;
+        connect(&socket, &QTcpSocket::readyRead, this, [&] {
+            buffer += socket.readAll();
+            QVERIFY(takeFrames(buffer, replies, nullptr));
+        });
+        QTRY_COMPARE_WITH_TIMEOUT(replies.size(), requests, 120000);
+        for (int id = 0; id < requests; ++id)
+            QCOMPARE(replies.at(id).value("id").toInt(), id);
+    }
+
+    // Clients past the cap are closed at once; a request frame longer than a request may be
+    // drops its client. The others are served.
+    void connectionBounds()
+    {
+        TcpAlarmServer tcp(*m_server);
+        tcp.setMaxConnections(2);
+        QVERIFY(tcp.listenOnLoopback(0));
+        QTcpSocket sockets[3];
+        for (QTcpSocket& socket : sockets) {
+            socket.connectToHost(QHostAddress::LocalHost, tcp.serverPort());
+            QVERIFY(socket.waitForConnected(5000));
+        }
+        QTRY_COMPARE(sockets[2].state(), QAbstractSocket::UnconnectedState);
+
+        QByteArray oversized(4, '\0');
+        qToBigEndian(quint32(TcpAlarmServer::MaxRequestPayload + 1), oversized.data());
+        sockets[1].write(oversized);
+        QTRY_COMPARE(sockets[1].state(), QAbstractSocket::UnconnectedState);
+
+        sockets[0].write(encodeFrame({{"id", 1}, {"method", "GetAlarmInfo"}, {"command", ""}}));
+        QTRY_VERIFY(sockets[0].bytesAvailable() > 0);
+        QVERIFY(sockets[0].state() == QAbstractSocket::ConnectedState);
     }
 };
 

@@ -1,15 +1,19 @@
 #include <AlarmPager.h>
+#include <AlarmSearchLimits.h>
 #include <AnswerFormat.h>
 #include <HostSession.h>
 #include <HostTunnelClient.h>
 #include <ReferenceHost.h>
+#include <TcpFrame.h>
 
 #include <PluginAlarmSearchCommon.h>
 #include <PluginObjBase_EventInfo.h>
 
+#include <QJsonObject>
 #include <QMutex>
 #include <QProcess>
 #include <QTcpServer>
+#include <QTcpSocket>
 #include <QtTest>
 
 #include <memory>
@@ -67,14 +71,17 @@ private:
     std::unique_ptr<QProcess> m_simulator;
     std::unique_ptr<ReferenceHost> m_host;
 
-    // Starts the simulator executable on a free port; returns "127.0.0.1:port".
-    QString startSimulator(int seedCount)
+    // Starts the simulator executable on a free port, with at most maxFiles file descriptors
+    // when given; returns "127.0.0.1:port".
+    QString startSimulator(int seedCount, int maxFiles = 0)
     {
         m_simulator = std::make_unique<QProcess>();
-        m_simulator->start(QStringLiteral(ALARMSEARCH_SIM_EXE),
-                           {QStringLiteral("--memory"), QStringLiteral("--port"),
-                            QStringLiteral("0"), QStringLiteral("--seed-count"),
-                            QString::number(seedCount)});
+        const QString command =
+            QStringLiteral("%1exec \"$0\" --memory --port 0 --seed-count %2")
+                .arg(maxFiles > 0 ? QStringLiteral("ulimit -n %1 && ").arg(maxFiles) : QString())
+                .arg(seedCount);
+        m_simulator->start(QStringLiteral("/bin/sh"),
+                           {QStringLiteral("-c"), command, QStringLiteral(ALARMSEARCH_SIM_EXE)});
         if (!m_simulator->waitForStarted(10000))
             return QString();
         while (!m_simulator->canReadLine() && m_simulator->waitForReadyRead(10000)) {
@@ -319,6 +326,46 @@ private slots:
         QVERIFY(m_host->tunnelClient().connectionError().endsWith(QLatin1String(" lost")));
     }
 
+    // Out of file descriptors, the simulator spun at full load, dropped its clients and died.
+    // Now it keeps serving the clients it has, and accepts again once descriptors are free.
+    void simulatorOutOfDescriptors()
+    {
+        const QString address = startSimulator(50, 40); // room for 8 clients
+        const quint16 port = address.section(QLatin1Char(':'), -1).toUShort();
+        QVERIFY(port != 0);
+        const auto answered = [](QTcpSocket& socket) {
+            socket.write(AlarmServerSim::encodeFrame(
+                {{"id", 1},
+                 {"method", "GetAlarmInfo"},
+                 {"command", "<GetAlarmInfo><AlarmID>A0000001</AlarmID></GetAlarmInfo>"}}));
+            QByteArray buffer;
+            QList<QJsonObject> replies;
+            while (replies.isEmpty() && socket.waitForReadyRead(10000)) {
+                buffer += socket.readAll();
+                AlarmServerSim::takeFrames(buffer, replies, nullptr);
+            }
+            return !replies.isEmpty() && replies.first().value("status").toString() == "0";
+        };
+        std::vector<std::unique_ptr<QTcpSocket>> clients;
+        for (int i = 0; i < 60; ++i) {
+            clients.push_back(std::make_unique<QTcpSocket>());
+            clients.back()->connectToHost(QHostAddress::LocalHost, port);
+            QVERIFY(clients.back()->waitForConnected(5000));
+        }
+        QTest::qWait(500);
+        QVERIFY(answered(*clients.front()));
+        clients.resize(1);
+        // Served once the simulator has seen the others go.
+        QTRY_VERIFY_WITH_TIMEOUT(
+            [&] {
+                QTcpSocket later;
+                later.connectToHost(QHostAddress::LocalHost, port);
+                return later.waitForConnected(5000) && answered(later);
+            }(),
+            20000);
+        QCOMPARE(m_simulator->state(), QProcess::Running);
+    }
+
     void recordLimitAndPagination()
     {
         const int seedCount = 2 * AlarmPager::kMaxRecords + 100;
@@ -374,6 +421,10 @@ private slots:
             << memory + QStringList{QStringLiteral("batch")}
             << QByteArray("{\"method\":\"QryAlarmList\",\"args\":{}}\n{\"method\": oops}\n") << 2
             << "line 2: bad JSON";
+        QTest::newRow("batch line past the bound")
+            << memory + QStringList{QStringLiteral("batch")}
+            << QByteArray(AlarmSearchLimits::MaxRequestLineBytes + 1, ' ') + '\n'
+            << 2 << "line 1: longer than";
         QTest::newRow("unknown batch method")
             << memory + QStringList{QStringLiteral("batch")}
             << QByteArray("{\"method\":\"ProcessAlarm\"}\n") << 2 << "line 1: \"method\" must be";

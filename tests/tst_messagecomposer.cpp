@@ -1,3 +1,4 @@
+#include <AlarmSearchLimits.h>
 #include <MessageComposer.h>
 #include <PluginAlarmSearchCommon.h>
 
@@ -140,6 +141,21 @@ private slots:
             << QVariantMap{{rules, QVariantList{rule(1, {}), rule(QStringLiteral("1"), {})}}}
             << "<TriggerEventList/><TriggerDeviceNameList/><TriggerDeviceNameList/>"
             << EmptyTimeBound;
+        // A value where a list is expected reads as a list of that one value.
+        const QString tagList = QStringLiteral("tagList");
+        QTest::newRow("tag lists as text")
+            << QVariantMap{{rules, QVariantList{QVariantMap{{"type", 0}, {tagList, "ab"}},
+                                                QVariantMap{{"type", 1}, {tagList, "cd"}}}}}
+            << "<TriggerEventList/><NameList><Name>ab</Name></NameList>"
+               "<TriggerDeviceNameList><DeviceName>cd</DeviceName></TriggerDeviceNameList>"
+            << EmptyTimeBound;
+        QTest::newRow("rules as text")
+            << QVariantMap{{rules, "abc"}} << "<TriggerEventList/><NameList/>" << EmptyTimeBound;
+        QTest::newRow("rules as one map")
+            << QVariantMap{{rules, QVariantMap{{"type", 1}, {tagList, QVariantList{"x"}}}}}
+            << "<TriggerEventList/><TriggerDeviceNameList><DeviceName>x</DeviceName>"
+               "</TriggerDeviceNameList>"
+            << EmptyTimeBound;
         QTest::newRow("names percent-encoded, device names escaped")
             << QVariantMap{{rules, QVariantList{rule(0, {"a b", "x/y", QStringLiteral("caf\u00e9"),
                                                          "", 42, "R&D<1>", "A-z_0.~"}),
@@ -225,6 +241,48 @@ private slots:
         QVERIFY(isWellFormed(message));
     }
 
+    // Filters beyond the bounds of a fragment are not written at all (the request is refused):
+    // the DOM's importer and writer recurse once per level, and 5000 levels overflowed the stack.
+    void refusedFilters_data()
+    {
+        QTest::addColumn<QString>("key");
+        QTest::addColumn<QString>("filter");
+        QTest::addColumn<bool>("refused");
+        const auto nested = [](int depth, bool closed) {
+            return QStringLiteral("<e>").repeated(depth) +
+                   (closed ? QStringLiteral("</e>").repeated(depth) : QString());
+        };
+        const int deepest = AlarmSearchLimits::MaxDepth;
+        for (const QString& key : {ARG_STATE_FILTER, ARG_TRIGGER_EVENT_FILTER}) {
+            const int wrapped = key == ARG_TRIGGER_EVENT_FILTER ? 1 : 0;
+            QTest::addRow("%s, at the depth bound", qPrintable(key))
+                << key << nested(deepest - wrapped, true) << false;
+            QTest::addRow("%s, one level deeper", qPrintable(key))
+                << key << nested(deepest - wrapped + 1, true) << true;
+            for (int depth : {5000, 100000})
+                QTest::addRow("%s, %d levels unclosed", qPrintable(key), depth)
+                    << key << nested(depth, false) << true;
+            QString attributes;
+            for (int i = 0; i < 80000; ++i)
+                attributes += QStringLiteral(" a%1='1'").arg(i);
+            QTest::addRow("%s, 80000 attributes", qPrintable(key))
+                << key << "<e" + attributes + "/>" << true;
+            QTest::addRow("%s, longer than the bound", qPrintable(key))
+                << key << "<e>" + QString(AlarmSearchLimits::MaxFragmentLength, u'x') + "</e>"
+                << true;
+        }
+    }
+
+    void refusedFilters()
+    {
+        QFETCH(QString, key);
+        QFETCH(QString, filter);
+        QFETCH(bool, refused);
+        const QString message = composer.composeQueryAlarmListMessage(QVariantMap{{key, filter}});
+        QCOMPARE(message.isEmpty(), refused);
+        QVERIFY(refused || isWellFormed(message));
+    }
+
     void processMessage_data()
     {
         QTest::addColumn<QStringList>("ids");
@@ -258,7 +316,7 @@ private slots:
             << "<ProcessAlarm><AlarmList><Alarm ID=\"%1\"/><Alarm ID=\"%2\"/></AlarmList>"
                "<Status><State>%1</State></Status><Note>%1</Note></ProcessAlarm>";
         QTest::newRow("characters XML cannot carry dropped")
-            << QStringList{QStringLiteral("a\x01")} << QVariantMap{{ARG_ALARM_STATUS, "b\x1f"}}
+            << QStringList{QStringLiteral("a")} << QVariantMap{{ARG_ALARM_STATUS, "b\x1f"}}
             << QStringLiteral("c\x0b\td")
             << "<ProcessAlarm><AlarmList><Alarm ID=\"a\"/></AlarmList><Status><State>b</State>"
                "</Status><Note>c\td</Note></ProcessAlarm>";
@@ -335,7 +393,8 @@ private slots:
     }
 
     // Whatever a value holds, every command stays well-formed, keeps its shape and reads the
-    // value back (less the characters XML cannot carry).
+    // value back exactly, white space included; free text loses the characters XML cannot
+    // carry, and an alarm ID holding one is not sent at all.
     void hostileValues_data()
     {
         QTest::addColumn<QString>("value");
@@ -346,6 +405,8 @@ private slots:
         for (const QString& value : markup) {
             QTest::newRow(qPrintable(value)) << value << value;
         }
+        QTest::newRow("line breaks and tabs") << "a\r\nb\rc\td\n"
+                                              << "a\r\nb\rc\td\n";
         QTest::newRow("control character") << QStringLiteral("a\x01z") << "az";
         QTest::newRow("unpaired surrogate") << QString(QChar(0xD800)) + "z"
                                             << "z";
@@ -357,17 +418,20 @@ private slots:
         QFETCH(QString, value);
         QFETCH(QString, readBack);
         const QString plain = QStringLiteral("v");
-        const auto commands = [this](const QString& v) {
-            return QStringList{composer.composeProcessAlarmMessage({v}, {{ARG_ALARM_STATUS, v}}, v),
-                               composer.composeGetAlarmInfoMessage(v),
-                               composer.composeMuteAlarmMessage({v}, true, 1),
-                               composer.composeQueryAlarmListMessage(QVariantMap{
-                                   {ARG_START_TIME, v},
-                                   {ARG_END_TIME, v},
-                                   {ARG_RULES, QVariantList{rule(1, {v}), rule(0, {v})}}})};
+        const auto commands = [this](const QString& id, const QString& v) {
+            return QStringList{
+                composer.composeProcessAlarmMessage({id}, {{ARG_ALARM_STATUS, v}}, v),
+                composer.composeGetAlarmInfoMessage(id),
+                composer.composeMuteAlarmMessage({id}, true, 1),
+                composer.composeQueryAlarmListMessage(
+                    QVariantMap{{ARG_START_TIME, v},
+                                {ARG_END_TIME, v},
+                                {ARG_RULES, QVariantList{rule(1, {v}), rule(0, {v})}}})};
         };
-        const QStringList expectedShapes = commands(plain);
-        const QStringList messages = commands(value);
+        const bool idSendable = readBack == value;
+        const QString id = idSendable ? value : plain;
+        const QStringList expectedShapes = commands(plain, plain);
+        const QStringList messages = commands(id, value);
         for (qsizetype i = 0; i < messages.size(); ++i) {
             QVERIFY2(isWellFormed(messages.at(i)), qPrintable(messages.at(i)));
             QCOMPARE(structureOf(parsed(messages.at(i))),
@@ -375,15 +439,20 @@ private slots:
         }
 
         const QDomElement process = parsed(messages.at(0));
-        QCOMPARE(process.firstChildElement().firstChildElement().attribute("ID"), readBack);
+        QCOMPARE(process.firstChildElement().firstChildElement().attribute("ID"), id);
         QCOMPARE(textAt(process, "State"), readBack);
         QCOMPARE(textAt(process, "Note"), readBack);
-        QCOMPARE(textAt(parsed(messages.at(1)), "AlarmID"), readBack);
-        QCOMPARE(textAt(parsed(messages.at(2)), "ID"), readBack);
+        QCOMPARE(textAt(parsed(messages.at(1)), "AlarmID"), id);
+        QCOMPARE(textAt(parsed(messages.at(2)), "ID"), id);
         const QDomElement query = parsed(messages.at(3));
         QCOMPARE(textAt(query, "StartTm"), readBack);
         QCOMPARE(textAt(query, "EndTm"), readBack);
         QCOMPARE(textAt(query, "DeviceName"), readBack);
+        if (!idSendable) {
+            QVERIFY(composer.composeProcessAlarmMessage({plain, value}, {}, plain).isEmpty());
+            QVERIFY(composer.composeGetAlarmInfoMessage(value).isEmpty());
+            QVERIFY(composer.composeMuteAlarmMessage({value}, false, 0).isEmpty());
+        }
     }
 
     // Found by fuzzing: the DOM reads "<?p\uFFFDx?>" but writes it back as "<?p\uFFFDx ?>",

@@ -1,5 +1,6 @@
 #include "support/FakeTunnelClient.h"
 
+#include <AlarmSearchLimits.h>
 #include <AlarmXmlParser.h>
 #include <ORVOSrvTunnelControl.h>
 #include <XmlHelper.h>
@@ -59,6 +60,33 @@ QueryOutcome query(const QString& reply)
     return outcome;
 }
 
+// Whether the update and history readers both read the reply; they agree on every reply.
+bool othersRead(const QString& reply)
+{
+    bool ok[2] = {};
+    const auto record = [](bool& target) {
+        return [&target](bool readOk, bool, const QVariant&, const QString&) { target = readOk; };
+    };
+    ORVOSrvTunnelControl::processAlarmCB(true, {}, "0", reply, true, record(ok[0]));
+    ORVOSrvTunnelControl::getAlarmInfoCB(true, {}, "0", reply, true, record(ok[1]));
+    if (ok[0] != ok[1])
+        qFatal("the update and history readers disagree");
+    return ok[0];
+}
+
+QString repeated(int count, const QString& pattern)
+{
+    QString text;
+    for (int i = 0; i < count; ++i)
+        text += pattern.arg(i);
+    return text;
+}
+
+QString reply(const QString& alarms, const QString& rootAttributes = {})
+{
+    return "<QryAlarmListRes" + rootAttributes + ">" + alarms + "</QryAlarmListRes>";
+}
+
 } // namespace
 
 class TestReplyBounds : public QObject
@@ -74,7 +102,7 @@ private slots:
         QTest::newRow("100000 levels inside an alarm")
             << "<QryAlarmListRes><Alarm>" + nested(Deep, true) + "</Alarm></QryAlarmListRes>";
         QTest::newRow("one level too deep") << "<QryAlarmListRes><Alarm>" +
-                                                   nested(AlarmXmlParser::MaxDepth - 1, true) +
+                                                   nested(AlarmSearchLimits::MaxDepth - 1, true) +
                                                    "</Alarm></QryAlarmListRes>";
     }
 
@@ -89,10 +117,72 @@ private slots:
         QVERIFY(!outcome.ok);
     }
 
+    // Each row a size that held a reply thread for seconds, took gigabytes or altered a value.
+    // CTest's time limit on this test guards against the quadratic ones coming back.
+    void boundedReplies_data()
+    {
+        QTest::addColumn<QString>("reply");
+        QTest::addColumn<int>("alarms"); // read by the alarm-list reader; -1: refused
+        QTest::addColumn<int>("keys");   // of the first alarm's map
+        QTest::addColumn<bool>("othersRead");
+        const QString surrogate(QChar(0xD800));
+        using namespace AlarmSearchLimits;
+
+        QTest::newRow("32000 distinct names in one alarm")
+            << reply("<Alarm>" + repeated(32000, "<n%1/>") + "</Alarm>") << 1 << 32001 << true;
+        QTest::newRow("80000 attributes on an alarm")
+            << reply("<Alarm" + repeated(80000, " a%1=''") + "/>") << -1 << 0 << false;
+        QTest::newRow("80000 attributes on the document element")
+            << reply("<Alarm/>", repeated(80000, " a%1=''")) << -1 << 0 << false;
+        QTest::newRow("attributes at the bound")
+            << reply("<Alarm" + repeated(MaxAttributes, " a%1=''") + "/>") << 1 << MaxAttributes + 1
+            << true;
+        QTest::newRow("lone surrogate in text")
+            << reply("<Alarm><N>a" + surrogate + "</N></Alarm>") << -1 << 0 << false;
+        QTest::newRow("lone surrogate in an attribute")
+            << reply("<Alarm N='" + surrogate + "'/>") << -1 << 0 << false;
+        QTest::newRow("alarms at the bound")
+            << reply(QStringLiteral("<Alarm/>").repeated(MaxReplyAlarms)) << int(MaxReplyAlarms)
+            << 1 << true;
+        QTest::newRow("one alarm more")
+            << reply(QStringLiteral("<Alarm/>").repeated(MaxReplyAlarms + 1)) << -1 << 0 << true;
+        QTest::newRow("one alarm more under another root")
+            << "<R>" + QStringLiteral("<Alarm/>").repeated(MaxReplyAlarms + 1) + "</R>" << -1 << 0
+            << true;
+        QTest::newRow("elements at the bound")
+            << reply(QStringLiteral("<A/>").repeated(MaxReplyElements - 1)) << 0 << 0 << true;
+        QTest::newRow("one element more")
+            << reply(QStringLiteral("<A/>").repeated(MaxReplyElements)) << -1 << 0 << false;
+        // Found by fuzzing: with namespace processing the depth check stopped at the undeclared
+        // prefix, where the DOM read on; the alarm came back as an empty text.
+        QTest::newRow("345 unclosed levels with a prefix")
+            << reply("<Alarm>" + QStringLiteral("<p:e>").repeated(345), {}).chopped(18) << -1 << 0
+            << false;
+    }
+
+    void boundedReplies()
+    {
+        QFETCH(QString, reply);
+        QFETCH(int, alarms);
+        QFETCH(int, keys);
+        QFETCH(bool, othersRead);
+        const std::optional<QVariantList> read = AlarmXmlParser::readAlarmListReply(reply);
+        QCOMPARE(read ? int(read->size()) : -1, alarms);
+        QCOMPARE(query(reply).ok, alarms >= 0);
+        // The splitter gives a text per alarm or nothing, never an alarm cut short.
+        const QList<QString> texts = AlarmXmlParser::getAlarmList(reply);
+        QCOMPARE(texts.size(), qMax(alarms, 0));
+        if (alarms > 0) {
+            QCOMPARE(read->first().toMap().size(), keys);
+            QCOMPARE(read->first().toMap().value("XML").toString(), texts.first());
+        }
+        QCOMPARE(::othersRead(reply), othersRead);
+    }
+
     void deepestAccepted()
     {
         const QString reply = "<QryAlarmListRes><Alarm>" +
-                              nested(AlarmXmlParser::MaxDepth - 2, true) +
+                              nested(AlarmSearchLimits::MaxDepth - 2, true) +
                               "</Alarm></QryAlarmListRes>";
         QCOMPARE(AlarmXmlParser::getAlarmList(reply).size(), 1);
         QCOMPARE(AlarmXmlParser::readAlarmListReply(reply)->size(), 1);
@@ -102,8 +192,8 @@ private slots:
     {
         QTest::addColumn<int>("depth");
         QTest::addColumn<bool>("written");
-        QTest::newRow("at the bound") << XmlHelper::MaxDepth << true;
-        QTest::newRow("one past the bound") << XmlHelper::MaxDepth + 1 << false;
+        QTest::newRow("at the bound") << AlarmSearchLimits::MaxDepth << true;
+        QTest::newRow("one past the bound") << AlarmSearchLimits::MaxDepth + 1 << false;
         QTest::newRow("100000 levels") << Deep << false;
     }
 
@@ -127,15 +217,15 @@ private slots:
     void oversizedReply()
     {
         const QString reply = QStringLiteral("<QryAlarmListRes><Alarm/>") +
-                              QString(AlarmXmlParser::MaxReplyLength, u' ') +
+                              QString(AlarmSearchLimits::MaxReplyLength, u' ') +
                               QStringLiteral("</QryAlarmListRes>");
         QCOMPARE(AlarmXmlParser::getAlarmList(reply), QList<QString>());
         QCOMPARE(AlarmXmlParser::readAlarmListReply(reply), std::nullopt);
         QVERIFY(!query(reply).ok);
 
         // Just within the bound it is read.
-        const QString largest =
-            reply.left(25) + reply.right(18) + QString(AlarmXmlParser::MaxReplyLength - 43, u' ');
+        const QString largest = reply.left(25) + reply.right(18) +
+                                QString(AlarmSearchLimits::MaxReplyLength - 43, u' ');
         QCOMPARE(AlarmXmlParser::readAlarmListReply(largest)->size(), 1);
     }
 

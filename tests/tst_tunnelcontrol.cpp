@@ -154,6 +154,24 @@ private slots:
         QCOMPARE(outcome.calls, 0);
     }
 
+    // A request the composer cannot write goes nowhere and is refused like a failed send.
+    void unwritableRequestsAreNotSent()
+    {
+        FakeTunnelClient tunnel;
+        ORVOSrvTunnelControl control(&tunnel);
+        Outcome outcome;
+        const QString deep = QStringLiteral("<e>").repeated(5000);
+        const QString badId = QStringLiteral("A1\x01");
+        QVERIFY(!control.queryAlarm(client, QVariantMap{{ARG_STATE_FILTER, deep}},
+                                    recordQuery(outcome)));
+        QVERIFY(!control.processAlarm(client, {{ARG_ALARMINFO_ID_LIST, QStringList{badId}}},
+                                      recordReply(outcome)));
+        QVERIFY(!control.getAlarmInfo(client, badId, "r", recordReply(outcome)));
+        control.muteAlarm(client, {badId}, true, 5);
+        QCOMPARE(tunnel.records().size(), 0);
+        QCOMPARE(outcome.calls, 0);
+    }
+
     void nonMapArgumentsStillQuery()
     {
         FakeTunnelClient tunnel;

@@ -1,3 +1,4 @@
+#include <AlarmSearchLimits.h>
 #include <XML2Json.h>
 
 #include <QtTest>
@@ -221,7 +222,7 @@ private slots:
             << "<!DOCTYPE R [<!ELEMENT R (#PCDATA)>]><R>x</R>";
         QTest::newRow("external entity")
             << "<!DOCTYPE R [<!ENTITY x SYSTEM 'file:///etc/passwd'>]><R>&x;</R>";
-        QTest::newRow("depth 257") << nested(XML2Json::MaxDepth + 1);
+        QTest::newRow("depth 257") << nested(AlarmSearchLimits::MaxDepth + 1);
         QTest::newRow("depth 100000") << nested(100000);
         QTest::newRow("depth 100000 unclosed") << QString(QStringLiteral("<e>")).repeated(100000);
     }
@@ -248,10 +249,10 @@ private slots:
 
     void depthBound()
     {
-        const QVariant deepest = XML2Json().parse(nested(XML2Json::MaxDepth));
-        QCOMPARE(depthOf(deepest), XML2Json::MaxDepth);
+        const QVariant deepest = XML2Json().parse(nested(AlarmSearchLimits::MaxDepth));
+        QCOMPARE(depthOf(deepest), AlarmSearchLimits::MaxDepth);
         XML2Json converter;
-        QVERIFY(!converter.parse(nested(XML2Json::MaxDepth + 1)).isValid());
+        QVERIFY(!converter.parse(nested(AlarmSearchLimits::MaxDepth + 1)).isValid());
         QVERIFY(converter.errorString().contains(QLatin1String("256")));
     }
 

@@ -3,6 +3,10 @@
 #include "AlarmRecord.h"
 #include "CommandXml.h"
 
+#include <AlarmSearchLimits.h>
+
+#include <QJsonArray>
+#include <QJsonDocument>
 #include <QRegularExpression>
 #include <QUrl>
 
@@ -29,15 +33,17 @@ std::optional<int> parseZoneOffset(const QString& text)
 class ConditionBuilder
 {
 public:
-    // Adds the alternatives joined by OR, as one condition; nothing when there are none.
-    void addAnyOf(const QStringList& alternatives)
-    {
-        if (!alternatives.isEmpty())
-            m_conditions.append(QLatin1Char('(') + alternatives.join(QLatin1String(" OR ")) +
-                                QLatin1Char(')'));
-    }
     void add(const QString& condition) { m_conditions.append(condition); }
     void bind(const QVariant& value) { m_bindings.append(value); }
+    // Adds the condition, which reads the items from json_each(?), bound to them as one JSON
+    // array; nothing when there are none.
+    void addForAnyOf(const QString& condition, const QJsonArray& items)
+    {
+        if (items.isEmpty())
+            return;
+        add(condition);
+        bind(QString::fromUtf8(QJsonDocument(items).toJson(QJsonDocument::Compact)));
+    }
 
     QString where() const
     {
@@ -51,35 +57,33 @@ private:
     QVariantList m_bindings;
 };
 
-// An Event with an attribute names one sub-event of its class; without, the whole class.
+// An Event with an attribute names one sub-event of its class; without, the whole class. Each
+// becomes [class] or [class, sub-event type, sub-event].
 void addEvents(ConditionBuilder& builder, const XmlElement& list)
 {
-    QStringList alternatives;
+    QJsonArray events;
     for (const XmlElement* event : list.childrenNamed(u"Event")) {
-        builder.bind(event->text.trimmed());
-        if (event->attributes.isEmpty()) {
-            alternatives.append(QStringLiteral("event_class = ?"));
-            continue;
-        }
-        builder.bind(event->attributes.first().first);
-        builder.bind(event->attributes.first().second);
-        alternatives.append(
-            QStringLiteral("(event_class = ? AND sub_event_type = ? AND sub_event = ?)"));
+        QJsonArray item{event->text.trimmed()};
+        if (!event->attributes.isEmpty())
+            item << event->attributes.first().first << event->attributes.first().second;
+        events.append(item);
     }
-    builder.addAnyOf(alternatives);
+    builder.addForAnyOf(
+        QStringLiteral("EXISTS (SELECT 1 FROM json_each(?) AS e WHERE "
+                       "event_class = e.value ->> 0 AND (json_array_length(e.value) = 1 OR "
+                       "(sub_event_type = e.value ->> 1 AND sub_event = e.value ->> 2)))"),
+        events);
 }
 
-// Each item adds one alternative "column op ?" bound to the folded item text.
-void addFoldedAlternatives(ConditionBuilder& builder, const QList<const XmlElement*>& items,
-                           const QString& alternative, bool percentEncoded)
+// The folded texts of the items.
+QJsonArray foldedTexts(const QList<const XmlElement*>& items, bool percentEncoded)
 {
-    QStringList alternatives;
+    QJsonArray texts;
     for (const XmlElement* item : items) {
         const QString text = item->text.trimmed();
-        builder.bind(foldName(percentEncoded ? QUrl::fromPercentEncoding(text.toUtf8()) : text));
-        alternatives.append(alternative);
+        texts.append(foldName(percentEncoded ? QUrl::fromPercentEncoding(text.toUtf8()) : text));
     }
-    builder.addAnyOf(alternatives);
+    return texts;
 }
 
 void addFilters(ConditionBuilder& builder, const XmlElement& filters)
@@ -87,19 +91,19 @@ void addFilters(ConditionBuilder& builder, const XmlElement& filters)
     if (const XmlElement* events = filters.child(u"TriggerEventList"))
         addEvents(builder, *events);
     if (const XmlElement* states = filters.child(u"AlarmStateList")) {
-        QStringList alternatives;
-        for (const XmlElement* state : states->childrenNamed(u"State")) {
-            builder.bind(state->text.trimmed());
-            alternatives.append(QStringLiteral("state = ?"));
-        }
-        builder.addAnyOf(alternatives);
+        QJsonArray names;
+        for (const XmlElement* state : states->childrenNamed(u"State"))
+            names.append(state->text.trimmed());
+        builder.addForAnyOf(QStringLiteral("state IN (SELECT value FROM json_each(?))"), names);
     }
     for (const XmlElement* names : filters.childrenNamed(u"NameList"))
-        addFoldedAlternatives(builder, names->childrenNamed(u"Name"),
-                              QStringLiteral("instr(alarm_name_folded, ?) > 0"), true);
+        builder.addForAnyOf(QStringLiteral("EXISTS (SELECT 1 FROM json_each(?) "
+                                           "WHERE instr(alarm_name_folded, value) > 0)"),
+                            foldedTexts(names->childrenNamed(u"Name"), true));
     for (const XmlElement* devices : filters.childrenNamed(u"TriggerDeviceNameList"))
-        addFoldedAlternatives(builder, devices->childrenNamed(u"DeviceName"),
-                              QStringLiteral("device_name_folded = ?"), false);
+        builder.addForAnyOf(
+            QStringLiteral("device_name_folded IN (SELECT value FROM json_each(?))"),
+            foldedTexts(devices->childrenNamed(u"DeviceName"), false));
 }
 
 bool addTimeBound(ConditionBuilder& builder, const XmlElement& bound)
@@ -136,14 +140,14 @@ std::optional<AlarmFilter> alarmFilterFromCommand(const XmlElement& command)
     }
 
     AlarmFilter filter;
-    filter.limit = kMaxRecords;
+    filter.limit = AlarmSearchLimits::MaxRecords;
     const QString maxRecords = command.childText(u"MaxRec");
     if (!maxRecords.isEmpty()) {
         bool ok = false;
         const int requested = maxRecords.toInt(&ok);
         if (!ok || requested <= 0)
             return std::nullopt;
-        filter.limit = qMin(requested, kMaxRecords);
+        filter.limit = qMin(requested, AlarmSearchLimits::MaxRecords);
     }
     if (const XmlElement* order = command.child(u"OrderBy"))
         filter.descending = order->childText(u"Descending") != QLatin1String("false");

@@ -13,15 +13,14 @@ struct XmlElement;
 struct AlarmFilter
 {
     QString where;          // SQL condition ("1" when nothing is filtered)
-    QVariantList bindings;  // values of the condition's placeholders, in order
+    QVariantList bindings;  // values of the condition's placeholders, in order; one per list
     int limit = 0;          // at most this many alarms
     bool descending = true; // newest first
 };
 
-// The most alarms one search returns.
-constexpr int kMaxRecords = 5000;
-
-// Reads the command's filters, time bound, record limit and order. Fails on a time, time zone or
+// Reads the command's filters, time bound, record limit (at most AlarmSearchLimits::MaxRecords)
+// and order. Each list of the filters is bound as one JSON array, so that any number of names
+// stays within SQLite's limit on bound parameters. Fails on a time, time zone or
 // record limit that it cannot read.
 std::optional<AlarmFilter> alarmFilterFromCommand(const XmlElement& command);
 

@@ -1,5 +1,8 @@
 #include "CommandXml.h"
 
+#include <AlarmSearchLimits.h>
+#include <XmlTextBounds.h>
+
 #include <QXmlStreamReader>
 
 namespace AlarmServerSim {
@@ -40,6 +43,10 @@ QString XmlElement::childText(QStringView childName) const
 
 std::optional<XmlElement> parseXmlDocument(const QString& text)
 {
+    // The tree's destructor recurses once per level, and the reader checks attributes for
+    // duplicates in quadratic time.
+    if (!AlarmSearchLimits::withinTextBounds(text))
+        return std::nullopt;
     QXmlStreamReader reader(text);
     XmlElement root;
     // Path from the document element down to the element being read.
@@ -49,6 +56,8 @@ std::optional<XmlElement> parseXmlDocument(const QString& text)
         case QXmlStreamReader::DTD:
             return std::nullopt;
         case QXmlStreamReader::StartElement: {
+            if (open.size() == AlarmSearchLimits::MaxDepth)
+                return std::nullopt;
             XmlElement* element = &root;
             if (!open.isEmpty()) {
                 open.last()->children.append(XmlElement());

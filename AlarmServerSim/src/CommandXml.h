@@ -26,8 +26,9 @@ struct XmlElement
     QString childText(QStringView name) const;
 };
 
-// Parses one XML document into its document element. Refuses text that is not well-formed and
-// any document with a DTD (no entity declarations reach the server).
+// Parses one XML document into its document element. Refuses text that is not well-formed, any
+// document with a DTD (no entity declarations reach the server), and text beyond the bounds of
+// AlarmSearchLimits on nesting, attributes per element and lone surrogates.
 std::optional<XmlElement> parseXmlDocument(const QString& text);
 
 // Appends <tag>value</tag>, or <tag/> when value is empty, with value escaped as element text.

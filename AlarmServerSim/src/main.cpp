@@ -73,7 +73,13 @@ int main(int argc, char* argv[])
         QStringLiteral("seed-count"),
         QStringLiteral("Demo alarms seeded into a new database (default: 30000)."),
         QStringLiteral("count"), QStringLiteral("30000"));
-    parser.addOptions({dbOption, memoryOption, portOption, seedCountOption});
+    const QCommandLineOption maxConnectionsOption(
+        QStringLiteral("max-connections"),
+        QStringLiteral("Clients served at once; more are closed at once (default: %1).")
+            .arg(AlarmServerSim::TcpAlarmServer::DefaultMaxConnections),
+        QStringLiteral("count"),
+        QString::number(AlarmServerSim::TcpAlarmServer::DefaultMaxConnections));
+    parser.addOptions({dbOption, memoryOption, portOption, seedCountOption, maxConnectionsOption});
     if (!parser.parse(app.arguments()))
         return usageError(parser.errorText());
     if (parser.isSet(helpOption) || parser.isSet(QStringLiteral("help-all"))) {
@@ -101,6 +107,11 @@ int main(int argc, char* argv[])
                               .arg(parser.value(seedCountOption)));
     if (parser.isSet(dbOption) && parser.isSet(memoryOption))
         return usageError(QStringLiteral("--db and --memory exclude each other"));
+    bool connectionsOk = false;
+    const int maxConnections = parser.value(maxConnectionsOption).toInt(&connectionsOk);
+    if (!connectionsOk || maxConnections < 1)
+        return usageError(QStringLiteral("--max-connections needs a number of 1 or more, not \"%1\"")
+                              .arg(parser.value(maxConnectionsOption)));
     options.databasePath = parser.isSet(memoryOption) ? QStringLiteral(":memory:")
                            : parser.isSet(dbOption)
                                ? parser.value(dbOption)
@@ -114,6 +125,7 @@ int main(int argc, char* argv[])
         return 1;
     }
     AlarmServerSim::TcpAlarmServer tcpServer(server);
+    tcpServer.setMaxConnections(maxConnections);
     if (!tcpServer.listenOnLoopback(quint16(port))) {
         std::fprintf(stderr, "cannot listen on 127.0.0.1:%u: %s\n", port,
                      qPrintable(tcpServer.errorString()));

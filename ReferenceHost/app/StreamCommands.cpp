@@ -3,6 +3,8 @@
 #include "Search.h"
 #include "Terminal.h"
 
+#include <AlarmSearchLimits.h>
+
 #include <AnswerFormat.h>
 #include <BatchRequest.h>
 #include <HostTunnelClient.h>
@@ -20,9 +22,6 @@
 using namespace PluginAlarmSearchCommon;
 
 namespace {
-
-// A request line is a few hundred bytes; anything near this is no request.
-const qint64 kMaxLineLength = 1 << 20;
 
 QString subscriptionKey(const QString& purpose)
 {
@@ -147,11 +146,11 @@ int batch(Cli& cli, const QStringList& arguments)
         return cli.fail(QStringLiteral("cannot read standard input"));
     bool allOk = true;
     for (int lineNumber = 1; !input.atEnd(); ++lineNumber) {
-        QByteArray line = input.readLine(kMaxLineLength + 1);
-        if (line.size() > kMaxLineLength)
+        QByteArray line = input.readLine(AlarmSearchLimits::MaxRequestLineBytes + 2);
+        if (line.size() > AlarmSearchLimits::MaxRequestLineBytes)
             return cli.usageError(QStringLiteral("line %1: longer than %2 bytes")
                                       .arg(lineNumber)
-                                      .arg(kMaxLineLength));
+                                      .arg(AlarmSearchLimits::MaxRequestLineBytes));
         line = line.trimmed();
         if (line.isEmpty())
             continue;

@@ -19,14 +19,13 @@
 //   {"R": {"A": ["1", "2"], "B": {"@x": "y", "#text": "t"}, "C": ""}}
 //
 // Hostile input is refused with an invalid result: a document type declaration (its entities
-// could expand without bound), nesting deeper than MaxDepth, undeclared entities, characters
-// that XML does not allow, and anything that is not one well-formed document element.
+// could expand without bound), text beyond the bounds of AlarmSearchLimits (longer than
+// MaxReplyLength, nested deeper than MaxDepth, more than MaxReplyElements elements or
+// MaxAttributes attributes on one element), undeclared entities, characters that XML does not
+// allow (lone surrogates included), and anything that is not one well-formed document element.
 class XML2Json
 {
 public:
-    // Deepest element nesting accepted; the document element is at depth 1.
-    static constexpr int MaxDepth = 256;
-
     // A QVariantMap holding one entry, keyed by the document element's name, with the element's
     // rendering as value. An invalid QVariant when the text is not a well-formed document or is
     // refused as hostile; errorString() then says why.

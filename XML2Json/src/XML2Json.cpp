@@ -1,5 +1,8 @@
 #include "XML2Json.h"
 
+#include <AlarmSearchLimits.h>
+#include <XmlTextBounds.h>
+
 #include <QVariantMap>
 #include <QXmlStreamReader>
 
@@ -58,12 +61,22 @@ QVariant XML2Json::parse(const QString& xml)
         m_errorString = why;
         return QVariant();
     };
+    if (xml.size() > AlarmSearchLimits::MaxReplyLength)
+        return refuse(QStringLiteral("Text longer than %1").arg(AlarmSearchLimits::MaxReplyLength));
+    if (!AlarmSearchLimits::withinTextBounds(xml))
+        return refuse(QStringLiteral("Lone surrogate or more than %1 attributes on an element")
+                          .arg(AlarmSearchLimits::MaxAttributes));
+    qsizetype elements = 0;
 
     while (!reader.atEnd()) {
         switch (reader.readNext()) {
         case QXmlStreamReader::StartElement:
-            if (open.size() == std::size_t(MaxDepth))
-                return refuse(QStringLiteral("Elements nested deeper than %1").arg(MaxDepth));
+            if (open.size() == std::size_t(AlarmSearchLimits::MaxDepth))
+                return refuse(QStringLiteral("Elements nested deeper than %1")
+                                  .arg(AlarmSearchLimits::MaxDepth));
+            if (++elements > AlarmSearchLimits::MaxReplyElements)
+                return refuse(QStringLiteral("More than %1 elements")
+                                  .arg(AlarmSearchLimits::MaxReplyElements));
             // The parent now renders as a map; its plain text is no longer needed.
             if (!open.empty())
                 open.back().leafText.clear();

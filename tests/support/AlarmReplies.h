@@ -65,4 +65,84 @@ inline QString reply(int count)
     return xml;
 }
 
+// Alarms of other shapes than alarm(), for the reader's speed and its agreement with the
+// general route on each.
+enum class Shape {
+    ThirtyFields,  // 30 fields
+    LongNonAscii,  // names and notes of a few hundred characters outside ASCII
+    Escaped,       // texts full of entities and character references
+    Attributes,    // two or three attributes on most elements
+    DistinctNames, // one field whose name no other alarm has
+};
+constexpr Shape Shapes[] = {Shape::ThirtyFields, Shape::LongNonAscii, Shape::Escaped,
+                            Shape::Attributes};
+
+inline const char* shapeName(Shape shape)
+{
+    switch (shape) {
+    case Shape::ThirtyFields:
+        return "30 fields";
+    case Shape::LongNonAscii:
+        return "long non-ASCII names and notes";
+    case Shape::Escaped:
+        return "escaped text";
+    case Shape::Attributes:
+        return "attributes";
+    case Shape::DistinctNames:
+        return "a distinct name per alarm";
+    }
+    return "";
+}
+
+inline QString shapedAlarm(Shape shape, int n)
+{
+    QString xml = alarm(n);
+    xml.chop(8); // "</Alarm>"
+    switch (shape) {
+    case Shape::ThirtyFields:
+        for (int field = 12; field <= 30; ++field)
+            xml += QStringLiteral("<Field%1>value %2-%1</Field%1>").arg(field).arg(n % 97);
+        break;
+    case Shape::LongNonAscii: {
+        const QString name = QString::fromUtf8("Überwachungskamera Südflügel Ebene ") +
+                             QString::fromUtf8("東門カメラ北側駐車場入口 ").repeated(4) +
+                             QString::number(n % 50);
+        xml += QStringLiteral("<LocationName>%1</LocationName><OperatorNote>%2</OperatorNote>")
+                   .arg(name, QString::fromUtf8("Проверено на месте, ложная тревога; "
+                                                "現場確認済み、誤報です。")
+                                  .repeated(3 + n % 4));
+        break;
+    }
+    case Shape::Escaped:
+        xml += QStringLiteral("<Detail>%1</Detail><Rule>a &lt; b &amp;&amp; c &gt; d</Rule>")
+                   .arg(QStringLiteral("&lt;tag a=&quot;%1&quot;&gt; &amp; &#x263A; &#233; ")
+                            .arg(n)
+                            .repeated(4));
+        break;
+    case Shape::Attributes:
+        xml = QStringLiteral("<Alarm seq=\"%1\" source=\"station-%2\">").arg(n).arg(n % 7) +
+              xml.mid(7)
+                  .replace(QLatin1String("<State>"),
+                           QStringLiteral("<State code=\"%1\" changed=\"true\">").arg(n % 4))
+                  .replace(QLatin1String("<DeviceName>"),
+                           QStringLiteral("<DeviceName id=\"D%1\" kind=\"camera\" zone=\"z%2\">")
+                               .arg(n % 6)
+                               .arg(n % 3));
+        break;
+    case Shape::DistinctNames:
+        xml += QStringLiteral("<Extra%1>x</Extra%1>").arg(n);
+        break;
+    }
+    return xml + QStringLiteral("</Alarm>");
+}
+
+inline QString shapedReply(Shape shape, int count)
+{
+    QString xml = QStringLiteral("<QryAlarmListRes>\n");
+    for (int n = 1; n <= count; ++n)
+        xml.append(shapedAlarm(shape, n)).append(u'\n');
+    xml += QStringLiteral("</QryAlarmListRes>");
+    return xml;
+}
+
 } // namespace AlarmReplies

@@ -13,10 +13,12 @@
 // - text and attribute values of characters XML allows, with the five predefined entities and
 //   character references (in text not to control characters); no raw carriage returns;
 // - no comments, processing instructions, CDATA sections or document type declaration;
-// - nesting up to XML2Json::MaxDepth, up to 32 attributes per element (one where the running
-//   Qt's DOM orders attributes in a way DomAttributeOrder cannot reproduce).
+// - nesting up to AlarmSearchLimits::MaxDepth, up to 32 attributes per element (one where the
+//   running Qt's DOM orders attributes in a way DomAttributeOrder cannot reproduce), within the
+//   element and alarm counts of AlarmSearchLimits.
 // Anything else gives nothing, also text that is not well-formed, and the caller takes the
-// general route.
+// general route. Its parts: ReplyTokenizer reads the text, AlarmSubtree captures an alarm,
+// AlarmMapBuilder renders it, AlarmTextWriter writes its text.
 class AlarmListScanner
 {
 public:

@@ -1,41 +1,25 @@
 #include "AlarmXmlParser.h"
 
 #include "AlarmListScanner.h"
+#include "AlarmSearchLimits.h"
 #include "XmlHelper.h"
 
 #include <XML2Json.h>
 
 #include <QDomDocument>
-#include <QXmlStreamReader>
 
 namespace {
 
-// Streams through the text before a DOM is built from it: false for text the DOM must not be
-// built from. The DOM would take time quadratic in the nesting depth, and its destructor and
-// writer recurse.
+using namespace AlarmSearchLimits;
+
+// Whether a DOM may be built from the reply: within the bounds of a reply, and with at most
+// MaxReplyAlarms alarms.
 bool safeForDom(const QString& text)
 {
-    if (text.size() > AlarmXmlParser::MaxReplyLength)
-        return false;
-    QXmlStreamReader reader(text);
-    int depth = 0;
-    while (!reader.atEnd()) {
-        switch (reader.readNext()) {
-        case QXmlStreamReader::StartElement:
-            if (++depth > AlarmXmlParser::MaxDepth)
-                return false;
-            break;
-        case QXmlStreamReader::EndElement:
-            --depth;
-            break;
-        case QXmlStreamReader::DTD:
-            return false;
-        default:
-            break;
-        }
-    }
-    // A fault ends the pass as it ends the DOM's parse: what comes after it is never built.
-    return true;
+    qsizetype alarms = 0;
+    return XmlHelper::safeForDom(text, MaxReplyLength, [&alarms](int depth, QStringView name) {
+        return depth != 2 || name != u"Alarm" || ++alarms <= MaxReplyAlarms;
+    });
 }
 
 } // namespace
@@ -68,7 +52,7 @@ std::optional<QVariantList> AlarmXmlParser::readAlarmListReply(const QString& re
 
 std::optional<QVariantList> AlarmXmlParser::readAlarmListReplyGeneral(const QString& replyText)
 {
-    if (replyText.size() > MaxReplyLength)
+    if (!safeForDom(replyText))
         return std::nullopt;
     const QVariant parsed = XML2Json().parse(replyText);
     if (!parsed.isValid() || parsed.isNull())

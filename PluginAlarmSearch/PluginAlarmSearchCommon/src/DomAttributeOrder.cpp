@@ -97,9 +97,10 @@ DomAttributeOrder::Positions DomAttributeOrder::arrange(Rule rule, const Names& 
         break;
     case Rule::Hash: {
         // Filled one by one like the DOM's own hash, without reserving, so that it grows alike.
-        QHash<QString, qsizetype> hash;
+        // Keyed by views: qHash of a view equals that of the string, so the order is the same.
+        QHash<QStringView, qsizetype> hash;
         for (qsizetype i = 0; i < names.size(); ++i)
-            hash.insert(names[i].toString(), i);
+            hash.insert(names[i], i);
         positions.clear();
         for (auto it = hash.cbegin(); it != hash.cend(); ++it)
             positions.append(it.value());

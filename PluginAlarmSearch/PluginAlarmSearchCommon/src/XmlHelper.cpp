@@ -1,10 +1,14 @@
 #include "XmlHelper.h"
 
+#include "AlarmSearchLimits.h"
 #include "DomAttributeOrder.h"
 #include "DomStyleWriter.h"
 
+#include "XmlTextBounds.h"
+
 #include <QTextStream>
 #include <QVarLengthArray>
+#include <QXmlStreamReader>
 
 namespace {
 
@@ -22,14 +26,14 @@ enum class Walk { Done, TooDeep, Stopped };
 // Walks the subtree below top in document order without recursion, top at level 1:
 // enter(node, level) comes before a node's children and stops the walk by returning false;
 // leave(node, level) comes after the children of a node that has some. A level deeper than
-// XmlHelper::MaxDepth stops the walk too.
+// AlarmSearchLimits::MaxDepth stops the walk too.
 template <typename Enter, typename Leave>
 Walk walkSubtree(const QDomNode& top, Enter&& enter, Leave&& leave)
 {
     QDomNode node = top;
     int level = 1;
     for (;;) {
-        if (level > XmlHelper::MaxDepth)
+        if (level > AlarmSearchLimits::MaxDepth)
             return Walk::TooDeep;
         if (!enter(node, level))
             return Walk::Stopped;
@@ -140,7 +144,8 @@ private:
     const DomAttributeOrder::Rule m_attributeOrder = DomAttributeOrder::forItemOrder();
 };
 
-// Whether the subtree below node is no deeper than XmlHelper::MaxDepth, found without recursion.
+// Whether the subtree below node is no deeper than AlarmSearchLimits::MaxDepth, found without
+// recursion.
 bool withinDepth(const QDomNode& node)
 {
     return walkSubtree(
@@ -158,6 +163,35 @@ QString savedByDom(const QDomNode& node)
 }
 
 } // namespace
+
+bool XmlHelper::safeForDom(const QString& text, qsizetype maxLength, const StartTagCheck& check)
+{
+    using namespace AlarmSearchLimits;
+    if (text.size() > maxLength || !withinTextBounds(text))
+        return false;
+    QXmlStreamReader reader(text);
+    reader.setNamespaceProcessing(false);
+    int depth = 0;
+    qsizetype elements = 0;
+    while (!reader.atEnd()) {
+        switch (reader.readNext()) {
+        case QXmlStreamReader::StartElement:
+            if (++depth > MaxDepth || ++elements > MaxReplyElements)
+                return false;
+            if (check && !check(depth, reader.qualifiedName()))
+                return false;
+            break;
+        case QXmlStreamReader::EndElement:
+            --depth;
+            break;
+        case QXmlStreamReader::DTD:
+            return false;
+        default:
+            break;
+        }
+    }
+    return true;
+}
 
 void XmlHelper::doSomeThingAllChildElement(const QDomElement& parent, const QString& tagName,
                                            ElementAction action)

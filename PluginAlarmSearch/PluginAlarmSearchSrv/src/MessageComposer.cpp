@@ -1,11 +1,16 @@
 #include "MessageComposer.h"
 
+#include <AlarmSearchLimits.h>
 #include <PluginAlarmSearchCommon.h>
+#include <XmlHelper.h>
 
 #include <QDomDocument>
 #include <QLocale>
 #include <QTimeZone>
 #include <QUrl>
+
+#include <algorithm>
+#include <optional>
 
 using namespace PluginAlarmSearchCommon;
 
@@ -27,6 +32,19 @@ qsizetype xmlCharLength(const QString& text, qsizetype i)
         return (i + 1 < text.size() && text.at(i + 1).isLowSurrogate()) ? 2 : 0;
     }
     return (QChar::isLowSurrogate(c) || c == 0xFFFE || c == 0xFFFF) ? 0 : 1;
+}
+
+// Whether XML can carry every character of text.
+bool isXmlText(const QString& text)
+{
+    for (qsizetype i = 0; i < text.size();) {
+        const qsizetype length = xmlCharLength(text, i);
+        if (length == 0) {
+            return false;
+        }
+        i += length;
+    }
+    return true;
 }
 
 // The text without the characters XML cannot carry. Neither the DOM serialiser nor the text
@@ -52,11 +70,45 @@ QString withoutInvalidXmlChars(const QString& text)
     return result;
 }
 
+// Where an escaped value goes: a reader normalises white space differently in each.
+enum class ValuePlace { Content, Attribute };
+
 // A value made safe for element content and double-quoted attribute values, so that it can
-// never end its element or add elements or attributes.
-QString escapedXml(const QString& text)
+// never end its element or add elements or attributes. Characters that a reader would normalise
+// are written as references, so that the server reads the value that was sent: carriage returns
+// everywhere, tabs and line feeds in attribute values, where they would become spaces.
+QString escapedXml(const QString& text, ValuePlace place = ValuePlace::Content)
 {
-    return withoutInvalidXmlChars(text).toHtmlEscaped();
+    QString escaped = withoutInvalidXmlChars(text).toHtmlEscaped();
+    escaped.replace(u'\r', QLatin1String("&#xd;"));
+    if (place == ValuePlace::Attribute) {
+        escaped.replace(u'\t', QLatin1String("&#x9;"));
+        escaped.replace(u'\n', QLatin1String("&#xa;"));
+    }
+    return escaped;
+}
+
+// Alarm IDs address alarms: one that XML cannot carry whole is not sent with characters
+// dropped, which could address another alarm.
+bool areSendableIds(const QList<QString>& ids)
+{
+    return std::all_of(ids.cbegin(), ids.cend(), isXmlText);
+}
+
+// A request argument where a list is expected: a list as it is, any other value as a list of
+// that one value (a text is not split into characters, a map not into its values), nothing as
+// an empty list.
+QVariantList listArgument(const QVariant& value)
+{
+    switch (value.metaType().id()) {
+    case QMetaType::UnknownType:
+        return {};
+    case QMetaType::QVariantList:
+    case QMetaType::QStringList:
+        return value.toList();
+    default:
+        return {value};
+    }
 }
 
 // Removes the processing instructions inside element. They address a parser, not the server,
@@ -87,9 +139,13 @@ void removeProcessingInstructions(const QDomElement& element)
 
 // Parses xml on its own and returns a deep copy of its document element owned by message; a
 // null node (which appends nothing) when nothing parsed. Text that breaks off keeps what was
-// built before the fault, so the parse result is deliberately not looked at.
-QDomNode importFragment(QDomDocument& message, const QString& xml)
+// built before the fault, so the parse result is deliberately not looked at. Nothing when the
+// text is beyond the bounds of a fragment: the DOM's importer and writer recurse once per level.
+std::optional<QDomNode> importFragment(QDomDocument& message, const QString& xml)
 {
+    if (!XmlHelper::safeForDom(xml, AlarmSearchLimits::MaxFragmentLength)) {
+        return std::nullopt;
+    }
     QDomDocument fragment;
     fragment.setContent(xml);
     const QDomElement element = fragment.documentElement();
@@ -128,15 +184,21 @@ QString MessageComposer::composeQueryAlarmListMessage(const QVariant& args)
 
     // The trigger-event and state filters are XML by design and go in unescaped; parsing each on
     // its own keeps a broken one, or one with extra top-level content, to its own element.
-    filters.appendChild(
+    const std::optional<QDomNode> events =
         importFragment(message, QStringLiteral("<TriggerEventList>%1</TriggerEventList>")
-                                    .arg(request.value(ARG_TRIGGER_EVENT_FILTER).toString())));
-    filters.appendChild(importFragment(message, request.value(ARG_STATE_FILTER).toString()));
+                                    .arg(request.value(ARG_TRIGGER_EVENT_FILTER).toString()));
+    const std::optional<QDomNode> state =
+        importFragment(message, request.value(ARG_STATE_FILTER).toString());
+    if (!events || !state) {
+        return QString();
+    }
+    filters.appendChild(*events);
+    filters.appendChild(*state);
 
-    const QVariantList rules = request.value(ARG_RULES).toList();
+    const QVariantList rules = listArgument(request.value(ARG_RULES));
     for (const QVariant& entry : rules) {
         const QVariantMap rule = entry.toMap();
-        const QVariantList tags = rule.value(QStringLiteral("tagList")).toList();
+        const QVariantList tags = listArgument(rule.value(QStringLiteral("tagList")));
         switch (rule.value(QStringLiteral("type")).toInt()) {
         case NameRule:
             filters.appendChild(listElement(message, QStringLiteral("NameList"),
@@ -154,7 +216,7 @@ QString MessageComposer::composeQueryAlarmListMessage(const QVariant& args)
 
     // Times are always sent as UTC. They are plain text: escaped, and inserted in one pass so
     // that a marker inside one value is never filled with another.
-    root.appendChild(importFragment(
+    root.appendChild(*importFragment(
         message,
         QStringLiteral("<TmBound><TZ>%1</TZ><StartTm>%2</StartTm><EndTm>%3</EndTm></TmBound>")
             .arg(QStringLiteral("+00:00"), escapedXml(request.value(ARG_START_TIME).toString()),
@@ -164,8 +226,9 @@ QString MessageComposer::composeQueryAlarmListMessage(const QVariant& args)
         textElement(message, QStringLiteral("TmBase"), QStringLiteral("Station"), false);
     timeBase.setAttribute(QStringLiteral("useUTC"), QStringLiteral("true"));
     root.appendChild(timeBase);
-    root.appendChild(textElement(message, QStringLiteral("MaxRec"), QStringLiteral("5000"), false));
-    root.appendChild(importFragment(
+    root.appendChild(textElement(message, QStringLiteral("MaxRec"),
+                                 QString::number(AlarmSearchLimits::MaxRecords), false));
+    root.appendChild(*importFragment(
         message, QStringLiteral(
                      "<OrderBy><Field>ServerTime</Field><Descending>true</Descending></OrderBy>")));
 
@@ -177,9 +240,13 @@ QString MessageComposer::composeProcessAlarmMessage(const QList<QString>& ids,
                                                     const QMap<QString, QVariant>& status,
                                                     const QString& note)
 {
+    if (!areSendableIds(ids)) {
+        return QString();
+    }
     QString message = QStringLiteral("<ProcessAlarm><AlarmList>");
     for (const QString& id : ids) {
-        message += QLatin1String("<Alarm ID=\"") + escapedXml(id) + QLatin1String("\"/>");
+        message += QLatin1String("<Alarm ID=\"") + escapedXml(id, ValuePlace::Attribute) +
+                   QLatin1String("\"/>");
     }
     message += QLatin1String("</AlarmList>");
 
@@ -201,12 +268,18 @@ QString MessageComposer::composeProcessAlarmMessage(const QList<QString>& ids,
 
 QString MessageComposer::composeGetAlarmInfoMessage(const QString& alarmId)
 {
+    if (!isXmlText(alarmId)) {
+        return QString();
+    }
     return QLatin1String("<GetAlarmInfo><AlarmID>") + escapedXml(alarmId) +
            QLatin1String("</AlarmID></GetAlarmInfo>");
 }
 
 QString MessageComposer::composeMuteAlarmMessage(const QList<QString>& ids, bool mute, int interval)
 {
+    if (!areSendableIds(ids)) {
+        return QString();
+    }
     QString idList;
     for (const QString& id : ids) {
         idList += QLatin1String("<ID>") + escapedXml(id) + QLatin1String("</ID>");

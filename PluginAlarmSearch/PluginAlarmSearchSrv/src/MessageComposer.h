@@ -6,9 +6,11 @@
 #include <QVariant>
 
 // Writes the XML commands sent to the management server: no XML declaration, no white space
-// between elements. Holds no state; any number of calls may run at once. Its virtual
-// operations are the whole of its vtable, in this order, for composers built elsewhere; owners
-// hold it through a QSharedPointer, which deletes a derived composer as what it was created as.
+// between elements. An empty text means the request cannot be sent: a filter fragment beyond
+// the bounds of AlarmSearchLimits, or an alarm ID holding a character XML cannot carry. Holds no
+// state; any number of calls may run at once. Its virtual operations are the whole of its vtable,
+// in this order, for composers built elsewhere; owners hold it through a QSharedPointer, which
+// deletes a derived composer as what it was created as.
 class MessageComposer
 {
 public:

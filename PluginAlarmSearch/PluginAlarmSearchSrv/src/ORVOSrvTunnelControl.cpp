@@ -51,16 +51,13 @@ void traceParseFailure(const char* readerName, const QString& replyText)
 }
 
 // Judges and converts a reply. Writes the reader's failure line and returns nothing when the
-// reply was rejected or does not parse; text longer than the alarm list's bound counts as not
-// parseable.
+// reply was rejected or does not parse; text beyond XML2Json's bounds counts as not parseable.
 std::optional<QVariantMap> readReply(const char* readerName, const char* rejectedFormat, bool ok,
                                      const QString& statusText, const QString& replyText)
 {
     if (!acceptReply(readerName, rejectedFormat, ok, statusText))
         return std::nullopt;
-    const QVariant parsed = replyText.size() > AlarmXmlParser::MaxReplyLength
-                                ? QVariant()
-                                : XML2Json().parse(replyText);
+    const QVariant parsed = XML2Json().parse(replyText);
     if (!parsed.isValid() || parsed.isNull()) {
         traceParseFailure(readerName, replyText);
         return std::nullopt;
@@ -83,7 +80,8 @@ void ORVOSrvTunnelControl::setMessageComposer(QSharedPointer<MessageComposer> co
 bool ORVOSrvTunnelControl::sendCommand(void* clientID, const QString& method,
                                        IOrvoTunnelClient::InsertRequestInfo& info)
 {
-    if (!m_pTunnelClient)
+    // The composer gives no command for a request it cannot write.
+    if (!m_pTunnelClient || info.commandText.isEmpty())
         return false;
     return m_pTunnelClient->InsertRequest(QString::fromUtf8(PALARMSEARCH_PLUGINID), clientID,
                                           IOrvoTunnelClient::RequestWithReply, method, info);
@@ -193,6 +191,8 @@ void ORVOSrvTunnelControl::muteAlarm(void* clientID, const QList<QString>& ids, 
         return;
     IOrvoTunnelClient::InsertRequestInfo info;
     info.commandText = m_spMessageComposer->composeMuteAlarmMessage(ids, mute, interval);
+    if (info.commandText.isEmpty())
+        return;
     // Fire and forget: the result is not observed and no reply is expected.
     m_pTunnelClient->InsertRequest(QString::fromUtf8(PALARMSEARCH_PLUGINID), clientID,
                                    IOrvoTunnelClient::RequestNoReply, METHOD_MUTE_ALARM, info);
