@@ -431,7 +431,7 @@ private slots:
         const QStringList lines =
             table.page({wide, plain}).split(QLatin1Char('\n'), Qt::SkipEmptyParts);
         QCOMPARE(lines.size(), 3);
-        QVERIFY2(lines[0].startsWith(QStringLiteral("ALARM     TIME (UTC+01)        ")),
+        QVERIFY2(lines[0].startsWith(QStringLiteral("ALARM     TIME (UTC+01:00)     ")),
                  qPrintable(lines[0]));
         QVERIFY2(lines[2].startsWith(QStringLiteral("A0000002  2026-11-20 12:59:00  ")),
                  qPrintable(lines[2]));

@@ -37,14 +37,30 @@ int charWidth(char32_t codePoint)
     return qMax(0, utf8proc_charwidth(utf8proc_int32_t(codePoint)));
 }
 
+// An IANA zone by its name; a fixed offset as UTC+HH:MM, which Qt versions name differently
+// (Qt 6.4 "UTC+01", later "UTC+01:00").
+QString zoneLabel(const QTimeZone& zone)
+{
+    if (zone == QTimeZone::utc())
+        return QStringLiteral("UTC");
+    const QString id = QString::fromUtf8(zone.id());
+    if (!id.startsWith(QLatin1String("UTC")))
+        return id;
+    const int offset = zone.offsetFromUtc(QDateTime::currentDateTimeUtc());
+    const int minutes = qAbs(offset) / 60;
+    return QStringLiteral("UTC%1%2:%3")
+        .arg(offset < 0 ? QLatin1Char('-') : QLatin1Char('+'))
+        .arg(minutes / 60, 2, 10, QLatin1Char('0'))
+        .arg(minutes % 60, 2, 10, QLatin1Char('0'));
+}
+
 } // namespace
 
 AlarmTable::AlarmTable(const QTimeZone& zone, int maxWidth) : m_zone(zone), m_maxWidth(maxWidth)
 {
     for (const Column& column : columns())
         m_titles.append(QString::fromLatin1(column.title));
-    m_titles[1] += QStringLiteral(" (%1)").arg(
-        zone == QTimeZone::utc() ? QStringLiteral("UTC") : QString::fromUtf8(zone.id()));
+    m_titles[1] += QStringLiteral(" (%1)").arg(zoneLabel(zone));
 }
 
 int AlarmTable::displayWidth(const QString& text)
