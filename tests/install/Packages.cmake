@@ -7,6 +7,9 @@ execute_process(COMMAND cpack -G DEB -B ${WORK_DIR} --config ${BUILD_DIR}/CPackC
                 OUTPUT_QUIET COMMAND_ERROR_IS_FATAL ANY)
 
 string(REGEX REPLACE "([][+.*()^$?|\\\\])" "\\\\\\1" sourcePattern ${SOURCE_DIR})
+# The tree's path where a path starts, not inside a relative one (a tree at /src would match
+# every "x/src/y" otherwise).
+set(sourcePattern "(^|[^A-Za-z0-9_.+-])${sourcePattern}/")
 set(debs)
 foreach(package ${PACKAGES})
     file(GLOB deb ${WORK_DIR}/${package}_*.deb)
