@@ -1,4 +1,5 @@
 #include <AlarmPager.h>
+#include <AlarmSearchLimits.h>
 #include <AlarmTable.h>
 #include <BatchRequest.h>
 #include <ExportWriter.h>
@@ -28,7 +29,7 @@ QVariantMap alarm(int id, const QDateTime& time)
 }
 
 // A server stand-in with the real one's search rules: inclusive time bounds, newest first,
-// at most kMaxRecords; ties in time come back in an arbitrary but fixed order.
+// at most AlarmSearchLimits::MaxRecords; ties in time come back in an arbitrary but fixed order.
 class FakeAlarmStore
 {
 public:
@@ -49,7 +50,7 @@ public:
                 alarm.value(QStringLiteral("ServerTime")).toString().chopped(1); // drop "Z"
             if (!end.isEmpty() && time > end)
                 continue;
-            if (page->size() == AlarmPager::kMaxRecords)
+            if (page->size() == AlarmSearchLimits::MaxRecords)
                 break;
             page->append(alarm);
         }
@@ -275,7 +276,7 @@ private slots:
     void pagerStopsWhenOneSecondHoldsMoreThanAPage()
     {
         QList<QVariantMap> alarms;
-        for (int i = 0; i < AlarmPager::kMaxRecords + 10; ++i)
+        for (int i = 0; i < AlarmSearchLimits::MaxRecords + 10; ++i)
             alarms.append(alarm(i + 1, kNow));
         FakeAlarmStore store(alarms);
         AlarmPager pager([&store](const QVariantMap& args, QVariantList* page, QString* error) {
@@ -284,7 +285,7 @@ private slots:
         QVariantList found;
         QString error;
         QVERIFY(fetchAll(pager, QVariantMap(), &found, &error));
-        QCOMPARE(found.size(), AlarmPager::kMaxRecords);
+        QCOMPARE(found.size(), AlarmSearchLimits::MaxRecords);
         QVERIFY(pager.warning().contains(QStringLiteral("may be missing")));
     }
 

@@ -368,10 +368,10 @@ private slots:
 
     void recordLimitAndPagination()
     {
-        const int seedCount = 2 * AlarmPager::kMaxRecords + 100;
+        const int seedCount = 2 * AlarmSearchLimits::MaxRecords + 100;
         openHost(QStringLiteral("embedded"), seedCount);
         const QVariantList capped = search(QVariantMap());
-        QCOMPARE(capped.size(), AlarmPager::kMaxRecords);
+        QCOMPARE(capped.size(), AlarmSearchLimits::MaxRecords);
 
         AlarmPager pager([this](const QVariantMap& args, QVariantList* page, QString*) {
             *page = search(args);
@@ -563,7 +563,7 @@ private slots:
                      .value(ARG_QUERY_RESULT)
                      .toArray()
                      .size(),
-                 AlarmPager::kMaxRecords);
+                 AlarmSearchLimits::MaxRecords);
 
         const QList<QByteArray> lines = run({QStringLiteral("query"), QStringLiteral("--all"),
                                              QStringLiteral("--format"), QStringLiteral("jsonl")})

@@ -4,6 +4,7 @@
 #include "Search.h"
 #include "Terminal.h"
 
+#include <AlarmSearchLimits.h>
 #include <AnswerFormat.h>
 #include <EventCatalog.h>
 #include <ExportWriter.h>
@@ -163,13 +164,16 @@ namespace Commands {
 int query(Cli& cli, const QStringList& arguments)
 {
     QCommandLineParser parser;
-    parser.setApplicationDescription(QStringLiteral(
-        "Searches alarms, newest first. The server returns at most 5000 alarms per search; a "
-        "search that comes back full is marked \"truncated\": true and said so on standard "
-        "error. --all walks back through older time windows until every match is found, "
-        "writing each page as it arrives."));
-    Cli::addFilterOptions(parser, QStringLiteral("Fetch every match, past the server's 5000 "
-                                                 "alarms per search."));
+    parser.setApplicationDescription(
+        QStringLiteral(
+            "Searches alarms, newest first. The server returns at most %1 alarms per search; a "
+            "search that comes back full is marked \"truncated\": true and said so on standard "
+            "error. --all walks back through older time windows until every match is found, "
+            "writing each page as it arrives.")
+            .arg(AlarmSearchLimits::MaxRecords));
+    Cli::addFilterOptions(
+        parser, QStringLiteral("Fetch every match, past the server's %1 alarms per search.")
+                    .arg(AlarmSearchLimits::MaxRecords));
     parser.addOptions({{QStringLiteral("format"),
                         QStringLiteral("json (one answer object), jsonl (one alarm per line) or "
                                        "table (default on a terminal)."),

@@ -2,6 +2,7 @@
 
 #include "Cli.h"
 
+#include <AlarmSearchLimits.h>
 #include <AnswerFormat.h>
 
 bool runSearch(Cli& cli, const QString& method, const QVariantMap& args, bool all,
@@ -28,7 +29,7 @@ bool runSearch(Cli& cli, const QString& method, const QVariantMap& args, bool al
             *exitCode = cli.fail(error);
             return false;
         }
-        *truncated = page.size() >= AlarmPager::kMaxRecords;
+        *truncated = page.size() >= AlarmSearchLimits::MaxRecords;
         if (*truncated)
             cli.printError(QStringLiteral("the server returned %1 alarms, its limit per search: "
                                           "older matches may be missing; use --all to fetch "

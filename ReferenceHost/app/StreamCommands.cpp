@@ -57,7 +57,7 @@ bool answerSearch(Cli& cli, const BatchRequest& request, bool* ok, int* exitCode
         if (!cli.call(request.method, request.args, &answers, exitCode))
             return false;
         answer = answers.constLast();
-        truncated = AnswerFormat::alarms(answer, false).size() >= AlarmPager::kMaxRecords;
+        truncated = AnswerFormat::alarms(answer, false).size() >= AlarmSearchLimits::MaxRecords;
     }
     QJsonObject object = AnswerFormat::answerObject(request.method, answer, cli.keepXml());
     object.insert(QStringLiteral("truncated"), truncated);

@@ -1,5 +1,6 @@
 #include "ApiRequest.h"
 
+#include <AlarmSearchLimits.h>
 #include <TimeArgument.h>
 
 #include <PluginAlarmSearchCommon.h>
@@ -158,7 +159,8 @@ bool search(const QJsonObject& body, bool unhandledOnly, const QDateTime& now, S
                   error) ||
         !textList(body, QStringLiteral("devices"), kMaxListItems, kMaxTextLength, &filter.devices,
                   error) ||
-        !textList(body, QStringLiteral("exclude"), 5000, kMaxIdLength, &search->exclude, error))
+        !textList(body, QStringLiteral("exclude"), AlarmSearchLimits::MaxRecords, kMaxIdLength,
+                  &search->exclude, error))
         return false;
     if (!checkTerms(filter, now, error))
         return false;

@@ -6,6 +6,7 @@
 #include "GuardedTcpServer.h"
 
 #include <AlarmPager.h>
+#include <AlarmSearchLimits.h>
 #include <HostSession.h>
 #include <HostTunnelClient.h>
 #include <PlainJson.h>
@@ -402,7 +403,7 @@ ApiServer::Reply ApiServer::search(const Call& call, const QString& user, bool u
 
     // A full page may have been cut by the server's limit: the next older page ends at its
     // oldest second, leaving out what this page already had of that second.
-    const bool truncated = page.size() >= AlarmPager::kMaxRecords;
+    const bool truncated = page.size() >= AlarmSearchLimits::MaxRecords;
     QJsonValue next = QJsonValue::Null;
     if (truncated) {
         const QString oldest = page.constLast().toMap().value(timeKey).toString();

@@ -2,6 +2,7 @@
 
 #include "TimeArgument.h"
 
+#include <AlarmSearchLimits.h>
 #include <PluginAlarmSearchCommon.h>
 
 #include <QSet>
@@ -34,13 +35,13 @@ bool AlarmPager::fetchAll(const QVariantMap& args, const PageSink& sink, QString
         m_alarmCount += added.size();
         if (!added.isEmpty() && !sink(added, errorMessage))
             return false;
-        if (page.size() < kMaxRecords)
+        if (page.size() < AlarmSearchLimits::MaxRecords)
             return true;
         const QString oldest = page.constLast().toMap().value(kServerTime).toString();
         const QDateTime oldestTime = QDateTime::fromString(oldest, Qt::ISODate);
         if (added.isEmpty() || !oldestTime.isValid()) {
             m_warning = QStringLiteral("more than %1 alarms at %2; some of them may be missing")
-                            .arg(kMaxRecords)
+                            .arg(AlarmSearchLimits::MaxRecords)
                             .arg(oldest);
             return true;
         }

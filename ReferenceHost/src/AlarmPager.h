@@ -7,7 +7,8 @@
 
 #include <functional>
 
-// Walks every alarm of a search, past the server's limit of records per search, handing each
+// Walks every alarm of a search, past the server's limit of records per search
+// (AlarmSearchLimits::MaxRecords), handing each
 // page on as it arrives: while a search comes back full, it searches again with the window's end
 // moved to the oldest alarm time seen. The bounds are inclusive, so alarms sharing that second
 // come back again; they are dropped by their AlarmID. Only the IDs of that one second are kept,
@@ -15,8 +16,6 @@
 class AlarmPager
 {
 public:
-    static constexpr int kMaxRecords = 5000;
-
     // One search with the given arguments; the alarms newest first.
     using PageQuery =
         std::function<bool(const QVariantMap& args, QVariantList* alarms, QString* errorMessage)>;

@@ -15,7 +15,7 @@ class MessageComposer
 {
 public:
     // "QryAlarmList": trigger events, state filter, name rules and the UTC time bound of the
-    // request map in args; newest first, at most 5000 records.
+    // request map in args; newest first, at most AlarmSearchLimits::MaxRecords records.
     virtual QString composeQueryAlarmListMessage(const QVariant& args);
     // "ProcessAlarm": sets state and note of the listed alarms.
     virtual QString composeProcessAlarmMessage(const QList<QString>& ids,
