@@ -373,7 +373,9 @@ private slots:
         const QVariantList capped = search(QVariantMap());
         QCOMPARE(capped.size(), AlarmSearchLimits::MaxRecords);
 
-        AlarmPager pager([this](const QVariantMap& args, QVariantList* page, QString*) {
+        int searches = 0;
+        AlarmPager pager([this, &searches](const QVariantMap& args, QVariantList* page, QString*) {
+            ++searches;
             *page = search(args);
             return true;
         });
@@ -386,7 +388,7 @@ private slots:
                 return true;
             },
             &error));
-        QCOMPARE(pager.pages(), 3);
+        QCOMPARE(searches, 3);
         QCOMPARE(all.size(), seedCount);
         QCOMPARE(all.mid(0, capped.size()), capped); // the newest first, as one search gives them
         const QStringList found = ids(all);

@@ -16,7 +16,6 @@ const QString kServerTime = QStringLiteral("ServerTime");
 
 bool AlarmPager::fetchAll(const QVariantMap& args, const PageSink& sink, QString* errorMessage)
 {
-    m_pages = 0;
     m_alarmCount = 0;
     m_warning.clear();
     QSet<QString> boundaryIds; // the alarms of the previous page at its oldest second
@@ -25,7 +24,6 @@ bool AlarmPager::fetchAll(const QVariantMap& args, const PageSink& sink, QString
         QVariantList page;
         if (!m_query(window, &page, errorMessage))
             return false;
-        ++m_pages;
         QVariantList added;
         added.reserve(page.size());
         for (const QVariant& alarm : std::as_const(page)) {

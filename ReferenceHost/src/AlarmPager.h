@@ -26,14 +26,12 @@ public:
 
     bool fetchAll(const QVariantMap& args, const PageSink& sink, QString* errorMessage);
 
-    int pages() const { return m_pages; }
     qint64 alarmCount() const { return m_alarmCount; }
     // Set when more alarms than one search returns share one second: some may be missing.
     QString warning() const { return m_warning; }
 
 private:
     PageQuery m_query;
-    int m_pages = 0;
     qint64 m_alarmCount = 0;
     QString m_warning;
 };

@@ -79,6 +79,5 @@ bool PluginLoader::load(const QString& fileName, QString* errorMessage)
         return false;
     }
     m_plugin = plugin;
-    m_pluginId = pluginId;
     return true;
 }

@@ -20,7 +20,6 @@ public:
     bool load(const QString& fileName, QString* errorMessage);
 
     IPluginObjectBase* plugin() const { return m_plugin; }
-    QString pluginId() const { return m_pluginId; }
 
     // $ALARMSEARCH_PLUGIN, else the plug-in in the installed plug-in folder, found relative to
     // the running executable's folder.
@@ -32,5 +31,4 @@ private:
     QString m_fileName;
     QPluginLoader m_loader;
     IPluginObjectBase* m_plugin = nullptr;
-    QString m_pluginId;
 };
