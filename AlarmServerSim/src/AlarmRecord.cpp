@@ -7,13 +7,6 @@
 
 namespace AlarmServerSim {
 
-const QStringList& alarmStates()
-{
-    static const QStringList states = {QStringLiteral("Unhandled"), QStringLiteral("Processing"),
-                                       QStringLiteral("Handled"), QStringLiteral("FalseAlarm")};
-    return states;
-}
-
 QString formatAlarmId(qint64 number)
 {
     return QStringLiteral("A%1").arg(number, 7, 10, QLatin1Char('0'));

@@ -11,9 +11,6 @@ class QSqlQuery;
 // Field formats and helpers shared by the database, the demo data and the replies.
 namespace AlarmServerSim {
 
-// The alarm states, in the order in which an alarm usually moves through them.
-const QStringList& alarmStates();
-
 // "A" followed by the alarm's number in seven digits.
 QString formatAlarmId(qint64 number);
 // The number of an alarm ID, or nothing for text that is not an alarm ID.

@@ -6,6 +6,9 @@
 #include "ConnectionPool.h"
 #include "DemoAlarms.h"
 
+#include <AlarmFields.h>
+#include <PluginAlarmSearchCommon.h>
+
 #include <QDir>
 #include <QFileInfo>
 #include <QReadWriteLock>
@@ -13,6 +16,8 @@
 #include <QSqlError>
 #include <QSqlQuery>
 #include <QStandardPaths>
+
+using namespace PluginAlarmSearchCommon;
 
 namespace AlarmServerSim {
 
@@ -65,18 +70,17 @@ void appendAlarmFields(QString& out, const QSqlQuery& row, qint64 now)
 {
     const QVariant muteUntil = row.value(9);
     const bool muted = !muteUntil.isNull() && muteUntil.toLongLong() > now;
-    appendTextElement(out, QLatin1String("AlarmID"), formatAlarmId(row.value(0).toLongLong()));
-    appendTextElement(out, QLatin1String("EventClass"), row.value(1).toString());
-    appendTextElement(out, QLatin1String("SubEventType"), row.value(2).toString());
-    appendTextElement(out, QLatin1String("SubEvent"), row.value(3).toString());
-    appendTextElement(out, QLatin1String("AlarmName"), row.value(4).toString());
-    appendTextElement(out, QLatin1String("DeviceName"), row.value(5).toString());
-    appendTextElement(out, QLatin1String("State"), row.value(6).toString());
-    appendTextElement(out, QLatin1String("ServerTime"), formatTime(row.value(7).toLongLong()));
-    appendTextElement(out, QLatin1String("Note"), row.value(8).toString());
-    appendTextElement(out, QLatin1String("Muted"),
-                      muted ? QStringLiteral("true") : QStringLiteral("false"));
-    appendTextElement(out, QLatin1String("MuteUntil"),
+    appendTextElement(out, FIELD_ALARM_ID, formatAlarmId(row.value(0).toLongLong()));
+    appendTextElement(out, FIELD_EVENT_CLASS, row.value(1).toString());
+    appendTextElement(out, FIELD_SUB_EVENT_TYPE, row.value(2).toString());
+    appendTextElement(out, FIELD_SUB_EVENT, row.value(3).toString());
+    appendTextElement(out, FIELD_ALARM_NAME, row.value(4).toString());
+    appendTextElement(out, FIELD_DEVICE_NAME, row.value(5).toString());
+    appendTextElement(out, FIELD_STATE, row.value(6).toString());
+    appendTextElement(out, FIELD_SERVER_TIME, formatTime(row.value(7).toLongLong()));
+    appendTextElement(out, FIELD_NOTE, row.value(8).toString());
+    appendTextElement(out, FIELD_MUTED, muted ? QStringLiteral("true") : QStringLiteral("false"));
+    appendTextElement(out, FIELD_MUTE_UNTIL,
                       muted ? formatTime(muteUntil.toLongLong()) : QString());
 }
 
@@ -176,10 +180,10 @@ CommandReply AlarmServer::execute(const QString& method, const QString& commandT
                                   const QString& operatorName)
 {
     static const QHash<QString, Private::CommandHandler> handlers = {
-        {QStringLiteral("QryAlarmList"), &Private::queryAlarmList},
-        {QStringLiteral("ProcessAlarm"), &Private::processAlarm},
-        {QStringLiteral("GetAlarmInfo"), &Private::getAlarmInfo},
-        {QStringLiteral("MuteAlarm"), &Private::muteAlarm},
+        {METHOD_QUERY_ALARM_LIST, &Private::queryAlarmList},
+        {METHOD_PROCESS_ALARM, &Private::processAlarm},
+        {METHOD_GET_ALARM_INFO, &Private::getAlarmInfo},
+        {METHOD_MUTE_ALARM, &Private::muteAlarm},
     };
     const Private::CommandHandler handler = handlers.value(method);
     if (!handler)
@@ -232,9 +236,9 @@ CommandReply AlarmServer::Private::processAlarm(QSqlDatabase db, const XmlElemen
 {
     QVariant state; // null: keep the alarm's state
     if (const XmlElement* status = command.child(u"Status")) {
-        if (status->child(u"State")) {
-            state = status->childText(u"State");
-            if (!alarmStates().contains(state.toString()))
+        if (status->child(FIELD_STATE)) {
+            state = status->childText(FIELD_STATE);
+            if (!ALARM_STATES.contains(state.toString()))
                 return badCommand();
         }
     }
@@ -273,8 +277,8 @@ CommandReply AlarmServer::Private::processAlarm(QSqlDatabase db, const XmlElemen
             }
         }
         reply += QLatin1String("<Result>");
-        appendTextElement(reply, QLatin1String("AlarmID"), id);
-        appendTextElement(reply, QLatin1String("Code"), found ? kResultOk : kResultUnknownAlarm);
+        appendTextElement(reply, FIELD_ALARM_ID, id);
+        appendTextElement(reply, FIELD_CODE, found ? kResultOk : kResultUnknownAlarm);
         reply += QLatin1String("</Result>");
     }
     reply += QLatin1String("</ProcessAlarmRes>");
@@ -287,7 +291,7 @@ CommandReply AlarmServer::Private::getAlarmInfo(QSqlDatabase, const XmlElement& 
                                                 const QString& /*user*/)
 {
     const CommandReply unknownAlarm{kStatusUnknownAlarm, QString()};
-    const std::optional<qint64> number = parseAlarmId(command.childText(u"AlarmID"));
+    const std::optional<qint64> number = parseAlarmId(command.childText(FIELD_ALARM_ID));
     if (!number)
         return unknownAlarm;
 
@@ -322,10 +326,10 @@ CommandReply AlarmServer::Private::getAlarmInfo(QSqlDatabase, const XmlElement& 
     reply += QLatin1String("<ChangeLogs>");
     while (log->next()) {
         reply += QLatin1String("<Entry>");
-        appendTextElement(reply, QLatin1String("Time"), formatTime(log->value(0).toLongLong()));
-        appendTextElement(reply, QLatin1String("State"), log->value(1).toString());
-        appendTextElement(reply, QLatin1String("Note"), log->value(2).toString());
-        appendTextElement(reply, QLatin1String("User"), log->value(3).toString());
+        appendTextElement(reply, FIELD_TIME, formatTime(log->value(0).toLongLong()));
+        appendTextElement(reply, FIELD_STATE, log->value(1).toString());
+        appendTextElement(reply, FIELD_NOTE, log->value(2).toString());
+        appendTextElement(reply, FIELD_USER, log->value(3).toString());
         reply += QLatin1String("</Entry>");
     }
     reply += QLatin1String("</ChangeLogs></Alarm></GetAlarmInfoRes>");

@@ -86,7 +86,7 @@ std::optional<XmlElement> parseXmlDocument(const QString& text)
     return root;
 }
 
-void appendTextElement(QString& out, QLatin1String tag, const QString& value)
+void appendTextElement(QString& out, const QString& tag, const QString& value)
 {
     out += QLatin1Char('<');
     out += tag;

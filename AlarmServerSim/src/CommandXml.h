@@ -32,6 +32,6 @@ struct XmlElement
 std::optional<XmlElement> parseXmlDocument(const QString& text);
 
 // Appends <tag>value</tag>, or <tag/> when value is empty, with value escaped as element text.
-void appendTextElement(QString& out, QLatin1String tag, const QString& value);
+void appendTextElement(QString& out, const QString& tag, const QString& value);
 
 } // namespace AlarmServerSim

@@ -3,6 +3,7 @@
 #include "AlarmRecord.h"
 #include "CommandXml.h"
 
+#include <AlarmFields.h>
 #include <PluginAlarmSearchCommon.h>
 
 #include <QHash>
@@ -11,6 +12,8 @@
 #include <QSqlQuery>
 
 #include <algorithm>
+
+using namespace PluginAlarmSearchCommon;
 
 namespace AlarmServerSim {
 
@@ -133,7 +136,6 @@ const QStringList& devicesFor(const QString& eventClass, const QStringList& frag
 // Every event of the three trigger-event filters.
 QList<DemoEvent> demoEvents()
 {
-    using namespace PluginAlarmSearchCommon;
     const std::pair<const QString*, const QStringList*> fragments[] = {
         {&CAMERA_TRIGGER_EVENT_FILTER_STRING, &kCameras},
         {&SYSTEM_TRIGGER_EVENT_FILTER_STRING, &kServers},
@@ -243,29 +245,30 @@ public:
     // What became of an alarm raised at time: older alarms are mostly dealt with.
     QList<LogEntry> history(qint64 time)
     {
-        QList<LogEntry> log = {{time, alarmStates().at(0), QString(), QStringLiteral("system")}};
+        QList<LogEntry> log = {{time, STATE_UNHANDLED, QString(), QStringLiteral("system")}};
         const bool old = m_end - time > 2 * 86400;
         const int roll = m_random.bounded(100);
         const int processingShare = old ? 5 : 25;
         const int handledShare = old ? 70 : 10;
         const int falseShare = old ? 10 : 5;
         if (roll < processingShare) {
-            addEntry(log, 1, kProcessingNotes);
+            addEntry(log, STATE_PROCESSING, kProcessingNotes);
         } else if (roll < processingShare + handledShare + falseShare) {
             if (m_random.bounded(10) < 6)
-                addEntry(log, 1, kProcessingNotes);
-            addEntry(log, roll < processingShare + handledShare ? 2 : 3,
-                     roll < processingShare + handledShare ? kHandledNotes : kFalseAlarmNotes);
+                addEntry(log, STATE_PROCESSING, kProcessingNotes);
+            if (roll < processingShare + handledShare)
+                addEntry(log, STATE_HANDLED, kHandledNotes);
+            else
+                addEntry(log, STATE_FALSE_ALARM, kFalseAlarmNotes);
         }
         return log;
     }
 
 private:
-    void addEntry(QList<LogEntry>& log, int stateIndex, const QStringList& notes)
+    void addEntry(QList<LogEntry>& log, const QString& state, const QStringList& notes)
     {
         const qint64 time = qMin(log.last().time + 60 + m_random.bounded(2 * 3600), m_end);
-        log.append({time, alarmStates().at(stateIndex),
-                    notes.at(m_random.bounded(int(notes.size()))),
+        log.append({time, state, notes.at(m_random.bounded(int(notes.size()))),
                     kUsers.at(m_random.bounded(int(kUsers.size())))});
     }
 

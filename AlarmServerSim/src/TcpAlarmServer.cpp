@@ -3,6 +3,8 @@
 #include "AlarmServer.h"
 #include "TcpFrame.h"
 
+#include <PluginAlarmSearchCommon.h>
+
 #include <QJsonObject>
 #include <QScopedValueRollback>
 #include <QSemaphore>
@@ -15,7 +17,6 @@ namespace AlarmServerSim {
 
 namespace {
 
-const QString kMuteMethod = QStringLiteral("MuteAlarm");
 const QString kStatusBadRequest = QStringLiteral("80000001");
 
 // What the socket reads ahead of the requests taken; the kernel holds the rest.
@@ -109,7 +110,7 @@ private:
                       command = command.toString(), operatorName] {
             const CommandReply reply = server.execute(method, command, operatorName);
             QJsonObject payload;
-            if (method != kMuteMethod)
+            if (method != PluginAlarmSearchCommon::METHOD_MUTE_ALARM)
                 payload = {{QLatin1String("id"), id},
                            {QLatin1String("status"), reply.statusText},
                            {QLatin1String("reply"), reply.replyText}};

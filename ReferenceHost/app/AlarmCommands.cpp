@@ -115,7 +115,7 @@ int update(Cli& cli, const QStringList& arguments)
     parser.addOptions({
         kIdOption,
         {QStringLiteral("state"),
-         QStringLiteral("New state: Unhandled, Processing, Handled or FalseAlarm."),
+         QStringLiteral("New state: %1.").arg(QueryArguments::stateChoices()),
          QStringLiteral("state")},
         {QStringLiteral("note"), QStringLiteral("Note stored with the change."),
          QStringLiteral("text")},

@@ -422,7 +422,7 @@ void Cli::addFilterOptions(QCommandLineParser& parser, const QString& allText)
          QStringLiteral("All trigger events of a group: camera, system or external; repeatable."),
          QStringLiteral("group")},
         {QStringLiteral("state"),
-         QStringLiteral("Alarm state: Unhandled, Processing, Handled or FalseAlarm; repeatable."),
+         QStringLiteral("Alarm state: %1; repeatable.").arg(QueryArguments::stateChoices()),
          QStringLiteral("state")},
         {QStringLiteral("from"),
          QStringLiteral("Oldest alarm time: ISO 8601 (2026-11-20T08:15:30Z, an offset such as "

@@ -7,6 +7,7 @@
 #include <AnswerFormat.h>
 #include <HostTunnelClient.h>
 
+#include <AlarmFields.h>
 #include <PluginAlarmSearchCommon.h>
 #include <PluginObjBase_EventInfo.h>
 
@@ -78,7 +79,7 @@ void DemoScript::showAlarms(const QVariantList& alarms)
 QVariantMap DemoScript::findAlarm(const QVariantList& alarms, const QString& id) const
 {
     for (const QVariant& alarm : alarms) {
-        if (alarm.toMap().value(QStringLiteral("AlarmID")).toString() == id)
+        if (alarm.toMap().value(FIELD_ALARM_ID).toString() == id)
             return alarm.toMap();
     }
     return QVariantMap();
@@ -110,8 +111,7 @@ int DemoScript::run()
 
     step(QStringLiteral("QryUnhandledAlarm: the unhandled alarms, newest first"));
     const QVariantMap unhandledArgs{
-        {ARG_STATE_FILTER,
-         QStringLiteral("<AlarmStateList><State>Unhandled</State></AlarmStateList>")}};
+        {ARG_STATE_FILTER, QueryArguments::stateFilter({STATE_UNHANDLED})}};
     PluginAnswer answer;
     if (!request(METHOD_QUERY_UNHANDLED_ALARM, unhandledArgs, &answer))
         return m_exitCode;
@@ -120,9 +120,9 @@ int DemoScript::run()
     showAlarms(unhandled);
     if (unhandled.size() < 3)
         return m_cli.fail(QStringLiteral("the demo needs at least three unhandled alarms"));
-    const QString first = unhandled[0].toMap().value(QStringLiteral("AlarmID")).toString();
-    const QString second = unhandled[1].toMap().value(QStringLiteral("AlarmID")).toString();
-    const QString third = unhandled[2].toMap().value(QStringLiteral("AlarmID")).toString();
+    const QString first = unhandled[0].toMap().value(FIELD_ALARM_ID).toString();
+    const QString second = unhandled[1].toMap().value(FIELD_ALARM_ID).toString();
+    const QString third = unhandled[2].toMap().value(FIELD_ALARM_ID).toString();
 
     step(QStringLiteral("QryAlarmList: camera alarms of the last 7 days, in any state"));
     const QVariantMap cameraArgs{
@@ -139,7 +139,7 @@ int DemoScript::run()
         QStringLiteral("UpdateAlarm: %1 and %2 become Processing, with a note").arg(first, second));
     if (!request(METHOD_UPDATE_ALARM,
                  QVariantMap{{ARG_ALARM_ID_LIST, QStringList{first, second}},
-                             {ARG_ALARM_STATUS, QStringLiteral("Processing")},
+                             {ARG_ALARM_STATUS, STATE_PROCESSING},
                              {ARG_ALARM_COMMENT, QStringLiteral("Operator on the way")}},
                  &answer))
         return m_exitCode;
@@ -158,11 +158,11 @@ int DemoScript::run()
     const QVariantList entries = answer.result.toList();
     for (const QVariant& entry : entries) {
         const QVariantMap fields = entry.toMap();
-        const QString note = fields.value(QStringLiteral("Note")).toString();
+        const QString note = fields.value(FIELD_NOTE).toString();
         say(QStringLiteral("   %1  %2  by %3%4")
-                .arg(fields.value(QStringLiteral("Time")).toString(),
-                     fields.value(QStringLiteral("State")).toString().leftJustified(10),
-                     fields.value(QStringLiteral("User")).toString(),
+                .arg(fields.value(FIELD_TIME).toString(),
+                     fields.value(FIELD_STATE).toString().leftJustified(10),
+                     fields.value(FIELD_USER).toString(),
                      note.isEmpty() ? QString() : QStringLiteral(": ") + note));
     }
 
@@ -187,8 +187,8 @@ int DemoScript::run()
             .arg(after.size())
             .arg(first, second));
     say(QStringLiteral("%1: Muted=%2, MuteUntil=%3")
-            .arg(third, muted.value(QStringLiteral("Muted")).toString(),
-                 muted.value(QStringLiteral("MuteUntil")).toString()));
+            .arg(third, muted.value(FIELD_MUTED).toString(),
+                 muted.value(FIELD_MUTE_UNTIL).toString()));
 
     m_cli.session().unsubscribe(key);
     m_cli.printOut(QByteArrayLiteral("\nDone: all six request methods answered as shown.\n"));

@@ -4,6 +4,7 @@
 #include "Search.h"
 #include "Terminal.h"
 
+#include <AlarmFields.h>
 #include <AlarmSearchLimits.h>
 #include <AnswerFormat.h>
 #include <EventCatalog.h>
@@ -75,8 +76,7 @@ public:
         m_page = alarms;
         m_results = std::vector<Slot>(size_t(alarms.size()));
         for (size_t i = 0; i < m_results.size(); ++i) {
-            const QString id =
-                alarms[qsizetype(i)].toMap().value(QStringLiteral("AlarmID")).toString();
+            const QString id = alarms[qsizetype(i)].toMap().value(FIELD_ALARM_ID).toString();
             m_pool.start([this, i, id] {
                 Slot result;
                 if (!m_stop)

@@ -5,6 +5,7 @@
 #include "EventSocket.h"
 #include "GuardedTcpServer.h"
 
+#include <AlarmFields.h>
 #include <AlarmPager.h>
 #include <AlarmSearchLimits.h>
 #include <HostSession.h>
@@ -393,11 +394,9 @@ ApiServer::Reply ApiServer::search(const Call& call, const QString& user, bool u
 
     const QVariantList page = answer.result.toMap().value(ARG_QUERY_RESULT).toList();
     const QSet<QString> excluded(search.exclude.cbegin(), search.exclude.cend());
-    const QString idKey = QStringLiteral("AlarmID");
-    const QString timeKey = QStringLiteral("ServerTime");
     QVariantList alarms;
     for (const QVariant& alarm : page) {
-        if (!excluded.contains(alarm.toMap().value(idKey).toString()))
+        if (!excluded.contains(alarm.toMap().value(FIELD_ALARM_ID).toString()))
             alarms.append(alarm);
     }
 
@@ -406,12 +405,12 @@ ApiServer::Reply ApiServer::search(const Call& call, const QString& user, bool u
     const bool truncated = page.size() >= AlarmSearchLimits::MaxRecords;
     QJsonValue next = QJsonValue::Null;
     if (truncated) {
-        const QString oldest = page.constLast().toMap().value(timeKey).toString();
+        const QString oldest = page.constLast().toMap().value(FIELD_SERVER_TIME).toString();
         QJsonArray boundary;
         for (const QVariant& alarm : page) {
             const QVariantMap fields = alarm.toMap();
-            if (fields.value(timeKey).toString() == oldest)
-                boundary.append(fields.value(idKey).toString());
+            if (fields.value(FIELD_SERVER_TIME).toString() == oldest)
+                boundary.append(fields.value(FIELD_ALARM_ID).toString());
         }
         QJsonObject nextBody = search.body;
         nextBody.insert(QStringLiteral("to"), PlainJson::time(oldest));

@@ -2,17 +2,13 @@
 
 #include "TimeArgument.h"
 
+#include <AlarmFields.h>
 #include <AlarmSearchLimits.h>
 #include <PluginAlarmSearchCommon.h>
 
 #include <QSet>
 
-namespace {
-
-const QString kAlarmId = QStringLiteral("AlarmID");
-const QString kServerTime = QStringLiteral("ServerTime");
-
-} // namespace
+using namespace PluginAlarmSearchCommon;
 
 bool AlarmPager::fetchAll(const QVariantMap& args, const PageSink& sink, QString* errorMessage)
 {
@@ -27,7 +23,7 @@ bool AlarmPager::fetchAll(const QVariantMap& args, const PageSink& sink, QString
         QVariantList added;
         added.reserve(page.size());
         for (const QVariant& alarm : std::as_const(page)) {
-            if (!boundaryIds.contains(alarm.toMap().value(kAlarmId).toString()))
+            if (!boundaryIds.contains(alarm.toMap().value(FIELD_ALARM_ID).toString()))
                 added.append(alarm);
         }
         m_alarmCount += added.size();
@@ -35,7 +31,7 @@ bool AlarmPager::fetchAll(const QVariantMap& args, const PageSink& sink, QString
             return false;
         if (page.size() < AlarmSearchLimits::MaxRecords)
             return true;
-        const QString oldest = page.constLast().toMap().value(kServerTime).toString();
+        const QString oldest = page.constLast().toMap().value(FIELD_SERVER_TIME).toString();
         const QDateTime oldestTime = QDateTime::fromString(oldest, Qt::ISODate);
         if (added.isEmpty() || !oldestTime.isValid()) {
             m_warning = QStringLiteral("more than %1 alarms at %2; some of them may be missing")
@@ -45,14 +41,13 @@ bool AlarmPager::fetchAll(const QVariantMap& args, const PageSink& sink, QString
         }
         // Alarms at the oldest second seen come back in the next window; remember all of them
         // (those of earlier pages at that second included).
-        if (page.constFirst().toMap().value(kServerTime).toString() != oldest)
+        if (page.constFirst().toMap().value(FIELD_SERVER_TIME).toString() != oldest)
             boundaryIds.clear();
         for (const QVariant& alarm : std::as_const(page)) {
             const QVariantMap fields = alarm.toMap();
-            if (fields.value(kServerTime).toString() == oldest)
-                boundaryIds.insert(fields.value(kAlarmId).toString());
+            if (fields.value(FIELD_SERVER_TIME).toString() == oldest)
+                boundaryIds.insert(fields.value(FIELD_ALARM_ID).toString());
         }
-        window.insert(PluginAlarmSearchCommon::ARG_END_TIME,
-                      TimeArgument::toServerTime(oldestTime));
+        window.insert(ARG_END_TIME, TimeArgument::toServerTime(oldestTime));
     }
 }

@@ -1,9 +1,12 @@
 #include "AlarmTable.h"
 
+#include <AlarmFields.h>
 #include <QDateTime>
 #include <QVariantMap>
 
 #include <utf8proc.h>
+
+using namespace PluginAlarmSearchCommon;
 
 namespace {
 
@@ -20,14 +23,10 @@ struct Column
 const QList<Column>& columns()
 {
     static const QList<Column> columns{
-        {"ALARM", {QStringLiteral("AlarmID")}, 8},
-        {"TIME", {QStringLiteral("ServerTime")}, 19},
-        {"STATE", {QStringLiteral("State")}, 5},
-        {"EVENT", {QStringLiteral("EventClass"), QStringLiteral("SubEvent")}, 5},
-        {"NAME", {QStringLiteral("AlarmName")}, 6},
-        {"DEVICE", {QStringLiteral("DeviceName")}, 6},
-        {"MUTED", {QStringLiteral("Muted")}, 5},
-        {"NOTE", {QStringLiteral("Note")}, 4},
+        {"ALARM", {FIELD_ALARM_ID}, 8},  {"TIME", {FIELD_SERVER_TIME}, 19},
+        {"STATE", {FIELD_STATE}, 5},     {"EVENT", {FIELD_EVENT_CLASS, FIELD_SUB_EVENT}, 5},
+        {"NAME", {FIELD_ALARM_NAME}, 6}, {"DEVICE", {FIELD_DEVICE_NAME}, 6},
+        {"MUTED", {FIELD_MUTED}, 5},     {"NOTE", {FIELD_NOTE}, 4},
     };
     return columns;
 }

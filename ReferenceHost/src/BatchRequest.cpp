@@ -148,21 +148,24 @@ bool readEventFilter(const QJsonValue& value, QVariant* out, QString* error)
 bool readRules(const QJsonValue& value, QVariant* out, QString* error)
 {
     QVariantList rules;
-    *error = QStringLiteral("expected a list of {\"type\": 0 or 1, \"tagList\": [texts]}");
+    *error = QStringLiteral("expected a list of {\"%1\": %2 or %3, \"%4\": [texts]}")
+                 .arg(ARG_RULE_TYPE)
+                 .arg(RULE_TYPE_NAME)
+                 .arg(RULE_TYPE_DEVICE_NAME)
+                 .arg(ARG_RULE_TAG_LIST);
     if (!value.isArray())
         return false;
     for (const QJsonValue& rule : value.toArray()) {
         const QJsonObject object = rule.toObject();
-        const QJsonValue type = object.value(QLatin1String("type"));
+        const QJsonValue type = object.value(ARG_RULE_TYPE);
         QStringList tags;
         QString tagError;
         if (!rule.isObject() || object.size() != 2 ||
-            (type.toInt(-1) != 0 && type.toInt(-1) != 1) ||
-            !object.value(QLatin1String("tagList")).isArray() ||
-            !textOrList(object.value(QLatin1String("tagList")), &tags, &tagError))
+            (type.toInt(-1) != RULE_TYPE_NAME && type.toInt(-1) != RULE_TYPE_DEVICE_NAME) ||
+            !object.value(ARG_RULE_TAG_LIST).isArray() ||
+            !textOrList(object.value(ARG_RULE_TAG_LIST), &tags, &tagError))
             return false;
-        rules.append(
-            QVariantMap{{QStringLiteral("type"), type.toInt()}, {QStringLiteral("tagList"), tags}});
+        rules.append(QVariantMap{{ARG_RULE_TYPE, type.toInt()}, {ARG_RULE_TAG_LIST, tags}});
     }
     error->clear();
     *out = rules;

@@ -3,22 +3,18 @@
 #include "AnswerFormat.h"
 #include "TimeArgument.h"
 
+#include <AlarmFields.h>
 #include <QJsonArray>
 #include <QJsonDocument>
 #include <QJsonObject>
 #include <QStringList>
 
+using namespace PluginAlarmSearchCommon;
+
 namespace {
 
-const QStringList kAlarmColumns{
-    QStringLiteral("AlarmID"),  QStringLiteral("EventClass"), QStringLiteral("SubEventType"),
-    QStringLiteral("SubEvent"), QStringLiteral("AlarmName"),  QStringLiteral("DeviceName"),
-    QStringLiteral("State"),    QStringLiteral("ServerTime"), QStringLiteral("Note"),
-    QStringLiteral("Muted"),    QStringLiteral("MuteUntil")};
-const QStringList kEntryColumns{QStringLiteral("Time"), QStringLiteral("State"),
-                                QStringLiteral("Note"), QStringLiteral("User")};
-const QStringList kTimeColumns{QStringLiteral("ServerTime"), QStringLiteral("MuteUntil"),
-                               QStringLiteral("Time")};
+const QStringList kEntryColumns{FIELD_TIME, FIELD_STATE, FIELD_NOTE, FIELD_USER};
+const QStringList kTimeColumns{FIELD_SERVER_TIME, FIELD_MUTE_UNTIL, FIELD_TIME};
 
 QStringList values(const QVariantMap& map, const QStringList& keys, const QTimeZone& zone)
 {
@@ -34,7 +30,7 @@ QStringList values(const QVariantMap& map, const QStringList& keys, const QTimeZ
 
 QStringList ExportWriter::csvColumns()
 {
-    QStringList header = kAlarmColumns;
+    QStringList header = ALARM_FIELDS;
     for (const QString& column : kEntryColumns)
         header.append(QStringLiteral("Change") + column);
     return header;
@@ -74,7 +70,7 @@ QByteArray ExportWriter::alarm(const ExportedAlarm& exported)
                AnswerFormat::jsonText(object, m_options.pretty, 4);
     }
     ++m_written;
-    const QStringList alarmFields = values(exported.alarm, kAlarmColumns, m_options.zone);
+    const QStringList alarmFields = values(exported.alarm, ALARM_FIELDS, m_options.zone);
     QList<QStringList> rows;
     for (const QVariant& entry : exported.history)
         rows.append(alarmFields + values(entry.toMap(), kEntryColumns, m_options.zone));

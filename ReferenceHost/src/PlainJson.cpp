@@ -2,6 +2,7 @@
 
 #include "HostSession.h"
 
+#include <AlarmFields.h>
 #include <PluginAlarmSearchCommon.h>
 #include <PluginObjBase_EventInfo.h>
 
@@ -20,9 +21,9 @@ enum class Kind { Boolean, Integer, Time };
 Kind const* kindOf(const QString& key)
 {
     static const QHash<QString, Kind> kinds{
-        {QStringLiteral("Muted"), Kind::Boolean},  {QStringLiteral("ServerTime"), Kind::Time},
-        {QStringLiteral("MuteUntil"), Kind::Time}, {QStringLiteral("Time"), Kind::Time},
-        {ARG_UPDATE_RESULT, Kind::Integer},        {ARG_IS_MUTE, Kind::Boolean},
+        {FIELD_MUTED, Kind::Boolean},          {FIELD_SERVER_TIME, Kind::Time},
+        {FIELD_MUTE_UNTIL, Kind::Time},        {FIELD_TIME, Kind::Time},
+        {ARG_UPDATE_RESULT, Kind::Integer},    {ARG_IS_MUTE, Kind::Boolean},
         {ARG_MUTE_TIME_SECOND, Kind::Integer},
     };
     const auto it = kinds.constFind(key);

@@ -3,23 +3,17 @@
 #include "EventCatalog.h"
 #include "TimeArgument.h"
 
+#include <AlarmFields.h>
 #include <PluginAlarmSearchCommon.h>
 
 #include <QRegularExpression>
 
 using namespace PluginAlarmSearchCommon;
 
-namespace {
-
-const QString kUnhandled = QStringLiteral("Unhandled");
-
-} // namespace
-
-const QStringList& QueryArguments::alarmStates()
+QString QueryArguments::stateChoices()
 {
-    static const QStringList states{kUnhandled, QStringLiteral("Processing"),
-                                    QStringLiteral("Handled"), QStringLiteral("FalseAlarm")};
-    return states;
+    return ALARM_STATES.mid(0, ALARM_STATES.size() - 1).join(QLatin1String(", ")) +
+           QLatin1String(" or ") + ALARM_STATES.constLast();
 }
 
 QString QueryArguments::method(const QueryFilter& filter)
@@ -31,14 +25,14 @@ bool QueryArguments::canonicalState(const QString& text, QString* state, QString
 {
     QString folded = text;
     folded.remove(QLatin1Char('-')).remove(QLatin1Char('_'));
-    for (const QString& known : alarmStates()) {
+    for (const QString& known : ALARM_STATES) {
         if (known.compare(folded, Qt::CaseInsensitive) == 0) {
             *state = known;
             return true;
         }
     }
     *errorMessage = QStringLiteral("unknown state \"%1\" (expected one of %2)")
-                        .arg(text, alarmStates().join(QLatin1String(", ")));
+                        .arg(text, ALARM_STATES.join(QLatin1String(", ")));
     return false;
 }
 
@@ -75,11 +69,11 @@ bool QueryArguments::build(const QueryFilter& filter, const QDateTime& now, QVar
         states.append(state);
     }
     if (filter.unhandledOnly) {
-        if (!states.isEmpty() && states != QStringList{kUnhandled}) {
+        if (!states.isEmpty() && states != QStringList{STATE_UNHANDLED}) {
             *errorMessage = QStringLiteral("--unhandled cannot be combined with other states");
             return false;
         }
-        states = QStringList{kUnhandled};
+        states = QStringList{STATE_UNHANDLED};
     }
 
     QString startTime;
@@ -97,11 +91,11 @@ bool QueryArguments::build(const QueryFilter& filter, const QDateTime& now, QVar
 
     QVariantList rules;
     if (!filter.names.isEmpty())
-        rules.append(QVariantMap{{QStringLiteral("type"), 0},
-                                 {QStringLiteral("tagList"), QVariant(filter.names)}});
+        rules.append(QVariantMap{{ARG_RULE_TYPE, RULE_TYPE_NAME},
+                                 {ARG_RULE_TAG_LIST, QVariant(filter.names)}});
     if (!filter.devices.isEmpty())
-        rules.append(QVariantMap{{QStringLiteral("type"), 1},
-                                 {QStringLiteral("tagList"), QVariant(filter.devices)}});
+        rules.append(QVariantMap{{ARG_RULE_TYPE, RULE_TYPE_DEVICE_NAME},
+                                 {ARG_RULE_TAG_LIST, QVariant(filter.devices)}});
 
     args->clear();
     if (!events.isEmpty())
@@ -175,11 +169,11 @@ bool QueryArguments::filterOf(const QVariantMap& args, QueryFilter* filter, QStr
         filter->states.append(match.captured(1).trimmed());
     for (const QVariant& rule : args.value(ARG_RULES).toList()) {
         const QVariantMap fields = rule.toMap();
-        const int type = fields.value(QStringLiteral("type")).toInt();
-        const QStringList tags = fields.value(QStringLiteral("tagList")).toStringList();
-        if (type == 0)
+        const int type = fields.value(ARG_RULE_TYPE).toInt();
+        const QStringList tags = fields.value(ARG_RULE_TAG_LIST).toStringList();
+        if (type == RULE_TYPE_NAME)
             filter->names += tags;
-        else if (type == 1)
+        else if (type == RULE_TYPE_DEVICE_NAME)
             filter->devices += tags;
     }
     filter->from = args.value(ARG_START_TIME).toString();

@@ -24,7 +24,8 @@ struct QueryFilter
 class QueryArguments
 {
 public:
-    static const QStringList& alarmStates();
+    // The alarm states for a help text: "Unhandled, Processing, Handled or FalseAlarm".
+    static QString stateChoices();
 
     // The request method the filter calls for: unhandled-only searches use "QryUnhandledAlarm".
     static QString method(const QueryFilter& filter);

@@ -31,6 +31,9 @@ static const QString ARG_STATE_FILTER = QStringLiteral("stateFilter");
 static const QString ARG_START_TIME = QStringLiteral("startTime");
 static const QString ARG_END_TIME = QStringLiteral("endTime");
 static const QString ARG_RULES = QStringLiteral("rules");
+// Keys of one ARG_RULES entry: which field its tags match, and the tags.
+static const QString ARG_RULE_TYPE = QStringLiteral("type");
+static const QString ARG_RULE_TAG_LIST = QStringLiteral("tagList");
 static const QString ARG_RELAY_PATH = QStringLiteral("relayPath");
 static const QString ARG_QUERY_RESULT = QStringLiteral("queryResult");
 static const QString ARG_ALARM_ID = QStringLiteral("alarmId");
@@ -46,6 +49,9 @@ static const QString ARG_ALARMINFO_STATUS = QStringLiteral("alarmInfoStatus");
 static const QString ARG_ALARMINFO_NOTE = QStringLiteral("alarmInfoNote");
 static const QString ARG_CHANGE_LOGS = QStringLiteral("changeLogs");
 static const QString ARG_EXPORT_ID = QStringLiteral("exportId");
+
+// Values of ARG_RULE_TYPE: the tags match alarm names, or trigger-device names.
+enum RuleType { RULE_TYPE_NAME = 0, RULE_TYPE_DEVICE_NAME = 1 };
 
 // Trigger-event filters a client can put under ARG_TRIGGER_EVENT_FILTER: runs of Event elements,
 // one per line. The attribute narrows an event class to one of its sub-events.

@@ -1,5 +1,6 @@
 #include "MessageComposer.h"
 
+#include <AlarmFields.h>
 #include <AlarmSearchLimits.h>
 #include <PluginAlarmSearchCommon.h>
 #include <XmlHelper.h>
@@ -15,9 +16,6 @@
 using namespace PluginAlarmSearchCommon;
 
 namespace {
-
-// Values of the "type" key of a rules entry.
-enum RuleType { NameRule = 0, DeviceNameRule = 1 };
 
 // Length in code units of the XML 1.0 character at position i: 1 or 2 (a surrogate pair), or 0
 // when XML cannot carry it (control characters other than tab and line breaks, unpaired
@@ -198,13 +196,13 @@ QString MessageComposer::composeQueryAlarmListMessage(const QVariant& args)
     const QVariantList rules = listArgument(request.value(ARG_RULES));
     for (const QVariant& entry : rules) {
         const QVariantMap rule = entry.toMap();
-        const QVariantList tags = listArgument(rule.value(QStringLiteral("tagList")));
-        switch (rule.value(QStringLiteral("type")).toInt()) {
-        case NameRule:
+        const QVariantList tags = listArgument(rule.value(ARG_RULE_TAG_LIST));
+        switch (rule.value(ARG_RULE_TYPE).toInt()) {
+        case RULE_TYPE_NAME:
             filters.appendChild(listElement(message, QStringLiteral("NameList"),
                                             QStringLiteral("Name"), tags, true));
             break;
-        case DeviceNameRule:
+        case RULE_TYPE_DEVICE_NAME:
             filters.appendChild(listElement(message, QStringLiteral("TriggerDeviceNameList"),
                                             QStringLiteral("DeviceName"), tags, false));
             break;
@@ -229,8 +227,8 @@ QString MessageComposer::composeQueryAlarmListMessage(const QVariant& args)
     root.appendChild(textElement(message, QStringLiteral("MaxRec"),
                                  QString::number(AlarmSearchLimits::MaxRecords), false));
     root.appendChild(*importFragment(
-        message, QStringLiteral(
-                     "<OrderBy><Field>ServerTime</Field><Descending>true</Descending></OrderBy>")));
+        message, QStringLiteral("<OrderBy><Field>%1</Field><Descending>true</Descending></OrderBy>")
+                     .arg(FIELD_SERVER_TIME)));
 
     message.appendChild(root);
     return message.toString(-1);

@@ -4,6 +4,7 @@
 #include "PluginAlarmSearchSrv_Log.h"
 #include "stdafx.h"
 
+#include <AlarmFields.h>
 #include <AlarmXmlParser.h>
 #include <XML2Json.h>
 
@@ -146,8 +147,8 @@ void ORVOSrvTunnelControl::processAlarmCB(bool ok, const QString& relayPath,
     for (const QVariant& entry : entries) {
         const QVariantMap fields = entry.toMap();
         result.append(QVariantMap{
-            {ARG_ALARM_ID, fields.value(QStringLiteral("AlarmID")).toString()},
-            {ARG_UPDATE_RESULT, fields.value(QStringLiteral("Code")).toString()},
+            {ARG_ALARM_ID, fields.value(FIELD_ALARM_ID).toString()},
+            {ARG_UPDATE_RESULT, fields.value(FIELD_CODE).toString()},
         });
     }
     completion(true, isLast, QVariant(std::move(result)), relayPath);
