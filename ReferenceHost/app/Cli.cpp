@@ -90,7 +90,7 @@ QList<QCommandLineOption> Cli::globalOptions() const
 
 Cli::~Cli() = default;
 
-QString Cli::printHelp() const
+QString Cli::helpText() const
 {
     QString help = QStringLiteral(
         "Usage: alarmsearch [global options] <command> [options]\n"
@@ -133,7 +133,7 @@ int Cli::run(const QStringList& arguments)
         }
     }
     if (help) {
-        printOut(printHelp().toUtf8());
+        printOut(helpText().toUtf8());
         return ExitOk;
     }
     if (!parsed)
@@ -146,7 +146,7 @@ int Cli::run(const QStringList& arguments)
         return ExitOk;
     }
     if (positional.isEmpty()) {
-        std::fputs(qPrintable(printHelp()), stderr);
+        std::fputs(qPrintable(helpText()), stderr);
         return ExitUsage;
     }
     m_command = positional.takeFirst();

@@ -72,7 +72,8 @@ public:
     static QStringList alarmIds(const QCommandLineParser& parser);
 
 private:
-    QString printHelp() const;
+    // The program's usage: its commands and the global options.
+    QString helpText() const;
     QList<QCommandLineOption> globalOptions() const;
     bool readTimeZone(int* exitCode);
     QString remoteHost() const;
