@@ -136,9 +136,9 @@ private slots:
     {
         QFETCH(QString, status);
         QFETCH(QString, written);
-        using AlarmSearchTrace::text;
+        using AlarmSearchTrace::local8Bit;
         const int line = __LINE__ + 1;
-        ALARMSEARCH_TRACE_FAILURE("%s, failed, %s", "queryAlarmCB", text(status).constData());
+        ALARMSEARCH_TRACE_FAILURE("%s, failed, %s", "queryAlarmCB", local8Bit(status).constData());
         QCOMPARE(m_recorder.journal(),
                  expected(AlarmSearchTrace::LevelFailure, line, written, false));
     }

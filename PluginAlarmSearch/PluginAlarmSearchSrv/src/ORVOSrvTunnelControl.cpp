@@ -41,14 +41,14 @@ bool acceptReply(const char* readerName, const char* rejectedFormat, bool ok,
     if (replyAccepted(ok, statusText))
         return true;
     ALARMSEARCH_TRACE_FAILURE(rejectedFormat, readerName,
-                              AlarmSearchTrace::text(statusText).constData());
+                              AlarmSearchTrace::local8Bit(statusText).constData());
     return false;
 }
 
 void traceParseFailure(const char* readerName, const QString& replyText)
 {
     ALARMSEARCH_TRACE_FAILURE("%s, parse message failed, %s", readerName,
-                              AlarmSearchTrace::text(replyText).constData());
+                              AlarmSearchTrace::local8Bit(replyText).constData());
 }
 
 // Judges and converts a reply. Writes the reader's failure line and returns nothing when the

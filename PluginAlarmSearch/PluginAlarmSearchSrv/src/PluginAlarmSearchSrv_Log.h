@@ -42,7 +42,7 @@ enum Level : int {
 bool check(int level, const char* file, int line);
 
 // A QString as the local 8-bit text the trace lines carry (a null string gives "").
-inline QByteArray text(const QString& s)
+inline QByteArray local8Bit(const QString& s)
 {
     return s.toLocal8Bit();
 }
