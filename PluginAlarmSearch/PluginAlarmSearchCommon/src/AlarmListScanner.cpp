@@ -4,7 +4,9 @@
 #include "AlarmSearchLimits.h"
 #include "AlarmSubtree.h"
 #include "AlarmTextWriter.h"
+#include "DomStyleWriter.h"
 #include "ReplyTokenizer.h"
+#include "Utf16Buffer.h"
 
 namespace {
 

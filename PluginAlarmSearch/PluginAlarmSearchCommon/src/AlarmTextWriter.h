@@ -3,6 +3,7 @@
 #include "AlarmSubtree.h"
 #include "DomAttributeOrder.h"
 #include "DomStyleWriter.h"
+#include "Utf16Buffer.h"
 
 // Writes a captured element as XmlHelper::nodeToXml writes the DOM's element: indented and
 // escaped as QDomNode::save does, blank text dropped as the DOM drops it, attributes in the

@@ -3,6 +3,7 @@
 #include "AlarmSearchLimits.h"
 #include "DomAttributeOrder.h"
 #include "DomStyleWriter.h"
+#include "Utf16Buffer.h"
 
 #include "XmlTextBounds.h"
 
