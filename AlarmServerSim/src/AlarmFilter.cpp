@@ -1,7 +1,7 @@
 #include "AlarmFilter.h"
 
-#include "AlarmRecord.h"
 #include "CommandXml.h"
+#include "FieldFormats.h"
 
 #include <AlarmSearchLimits.h>
 

@@ -1,10 +1,10 @@
 #include "AlarmServer.h"
 
 #include "AlarmFilter.h"
-#include "AlarmRecord.h"
 #include "CommandXml.h"
 #include "ConnectionPool.h"
 #include "DemoAlarms.h"
+#include "FieldFormats.h"
 
 #include <AlarmFields.h>
 #include <PluginAlarmSearchCommon.h>

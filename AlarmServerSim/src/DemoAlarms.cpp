@@ -1,7 +1,7 @@
 #include "DemoAlarms.h"
 
-#include "AlarmRecord.h"
 #include "CommandXml.h"
+#include "FieldFormats.h"
 
 #include <AlarmFields.h>
 #include <PluginAlarmSearchCommon.h>

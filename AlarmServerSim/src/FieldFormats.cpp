@@ -1,4 +1,4 @@
-#include "AlarmRecord.h"
+#include "FieldFormats.h"
 
 #include <QDateTime>
 #include <QRegularExpression>
