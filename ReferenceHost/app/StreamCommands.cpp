@@ -66,6 +66,70 @@ bool answerSearch(Cli& cli, const BatchRequest& request, bool* ok, int* exitCode
     return true;
 }
 
+// Reads the request on line lineNumber of input into request; false with exitCode set when the
+// line is too long or no valid request, and with request->method empty for a blank line.
+bool readRequestLine(Cli& cli, QFile& input, int lineNumber, BatchRequest* request, int* exitCode)
+{
+    QByteArray line = input.readLine(AlarmSearchLimits::MaxRequestLineBytes + 2);
+    if (line.size() > AlarmSearchLimits::MaxRequestLineBytes) {
+        *exitCode = cli.usageError(QStringLiteral("line %1: longer than %2 bytes")
+                                       .arg(lineNumber)
+                                       .arg(AlarmSearchLimits::MaxRequestLineBytes));
+        return false;
+    }
+    line = line.trimmed();
+    *request = BatchRequest();
+    if (line.isEmpty())
+        return true;
+    QJsonParseError parseError;
+    const QJsonDocument document = QJsonDocument::fromJson(line, &parseError);
+    QString error;
+    if (parseError.error != QJsonParseError::NoError)
+        error = QStringLiteral("bad JSON: %1").arg(parseError.errorString());
+    else if (!document.isObject())
+        error = QStringLiteral("a request is a JSON object");
+    else if (BatchRequest::read(document.object(), QDateTime::currentDateTimeUtc(), cli.timeZone(),
+                                request, &error))
+        return true;
+    *exitCode = cli.usageError(QStringLiteral("line %1: %2").arg(lineNumber).arg(error));
+    return false;
+}
+
+// Sends a MuteAlarm line, which gets no answer, and waits until it is carried out: later lines
+// must see it.
+bool sendMute(Cli& cli, const BatchRequest& request, int lineNumber, int* exitCode)
+{
+    cli.session().send(request.method, request.args);
+    if (!cli.session().waitForIdle(cli.timeoutMs())) {
+        *exitCode = cli.fail(QStringLiteral("line %1: %2 not delivered in time")
+                                 .arg(lineNumber)
+                                 .arg(request.method));
+        return false;
+    }
+    cli.printOut(AnswerFormat::jsonLine(
+        QJsonObject{{QStringLiteral("method"), request.method}, {QStringLiteral("sent"), true}},
+        cli.pretty()));
+    return true;
+}
+
+// Prints every answer of one request line; ok becomes false when one of them is a failure.
+bool answerRequest(Cli& cli, const BatchRequest& request, int lineNumber, bool* ok, int* exitCode)
+{
+    const QString& method = request.method;
+    if (method == METHOD_MUTE_ALARM)
+        return sendMute(cli, request, lineNumber, exitCode);
+    if (method == METHOD_QUERY_ALARM_LIST || method == METHOD_QUERY_UNHANDLED_ALARM)
+        return answerSearch(cli, request, ok, exitCode);
+    QList<PluginAnswer> answers;
+    if (!cli.call(method, request.args, &answers, exitCode))
+        return false;
+    for (const PluginAnswer& answer : std::as_const(answers)) {
+        cli.printAnswer(method, answer);
+        *ok = *ok && answer.resultCode == QLatin1String("0");
+    }
+    return true;
+}
+
 } // namespace
 
 namespace Commands {
@@ -146,52 +210,12 @@ int batch(Cli& cli, const QStringList& arguments)
         return cli.fail(QStringLiteral("cannot read standard input"));
     bool allOk = true;
     for (int lineNumber = 1; !input.atEnd(); ++lineNumber) {
-        QByteArray line = input.readLine(AlarmSearchLimits::MaxRequestLineBytes + 2);
-        if (line.size() > AlarmSearchLimits::MaxRequestLineBytes)
-            return cli.usageError(QStringLiteral("line %1: longer than %2 bytes")
-                                      .arg(lineNumber)
-                                      .arg(AlarmSearchLimits::MaxRequestLineBytes));
-        line = line.trimmed();
-        if (line.isEmpty())
-            continue;
-        QJsonParseError parseError;
-        const QJsonDocument document = QJsonDocument::fromJson(line, &parseError);
-        if (parseError.error != QJsonParseError::NoError)
-            return cli.usageError(QStringLiteral("line %1: bad JSON: %2")
-                                      .arg(lineNumber)
-                                      .arg(parseError.errorString()));
         BatchRequest request;
-        QString error;
-        if (!document.isObject())
-            return cli.usageError(
-                QStringLiteral("line %1: a request is a JSON object").arg(lineNumber));
-        if (!BatchRequest::read(document.object(), QDateTime::currentDateTimeUtc(), cli.timeZone(),
-                                &request, &error))
-            return cli.usageError(QStringLiteral("line %1: %2").arg(lineNumber).arg(error));
-        const QString& method = request.method;
-        if (method == METHOD_MUTE_ALARM) {
-            cli.session().send(method, request.args);
-            // Later lines must see the mute carried out.
-            if (!cli.session().waitForIdle(cli.timeoutMs()))
-                return cli.fail(
-                    QStringLiteral("line %1: MuteAlarm not delivered in time").arg(lineNumber));
-            cli.printOut(AnswerFormat::jsonLine(
-                QJsonObject{{QStringLiteral("method"), method}, {QStringLiteral("sent"), true}},
-                cli.pretty()));
-            continue;
-        }
-        if (method == METHOD_QUERY_ALARM_LIST || method == METHOD_QUERY_UNHANDLED_ALARM) {
-            if (!answerSearch(cli, request, &allOk, &exitCode))
-                return exitCode;
-            continue;
-        }
-        QList<PluginAnswer> answers;
-        if (!cli.call(method, request.args, &answers, &exitCode))
+        if (!readRequestLine(cli, input, lineNumber, &request, &exitCode))
             return exitCode;
-        for (const PluginAnswer& answer : std::as_const(answers)) {
-            cli.printAnswer(method, answer);
-            allOk = allOk && answer.resultCode == QLatin1String("0");
-        }
+        if (!request.method.isEmpty() &&
+            !answerRequest(cli, request, lineNumber, &allOk, &exitCode))
+            return exitCode;
     }
     cli.session().unsubscribe(key);
     return allOk ? Cli::ExitOk : Cli::ExitFailed;
