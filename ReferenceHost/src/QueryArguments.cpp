@@ -44,51 +44,65 @@ QString QueryArguments::stateFilter(const QStringList& states)
     return QStringLiteral("<AlarmStateList>%1</AlarmStateList>").arg(stateList);
 }
 
-bool QueryArguments::build(const QueryFilter& filter, const QDateTime& now, QVariantMap* args,
-                           QString* errorMessage)
+namespace {
+
+// The Event elements of the filter's event groups and events, in that order.
+bool eventElements(const QueryFilter& filter, QString* events, QString* errorMessage)
 {
-    QString events;
     for (const QString& group : filter.eventGroups) {
         QString elements;
         if (!EventCatalog::groupFilter(group, &elements, errorMessage))
             return false;
-        events += elements;
+        *events += elements;
     }
     for (const QString& event : filter.events) {
         QString element;
         if (!EventCatalog::element(event, &element, errorMessage))
             return false;
-        events += element;
+        *events += element;
     }
+    return true;
+}
 
-    QStringList states;
+// The filter's states in the server's spelling; an unhandled-only search has that one state.
+bool serverStates(const QueryFilter& filter, QStringList* states, QString* errorMessage)
+{
     for (const QString& text : filter.states) {
         QString state;
-        if (!canonicalState(text, &state, errorMessage))
+        if (!QueryArguments::canonicalState(text, &state, errorMessage))
             return false;
-        states.append(state);
+        states->append(state);
     }
     if (filter.unhandledOnly) {
-        if (!states.isEmpty() && states != QStringList{STATE_UNHANDLED}) {
+        if (!states->isEmpty() && *states != QStringList{STATE_UNHANDLED}) {
             *errorMessage = QStringLiteral("--unhandled cannot be combined with other states");
             return false;
         }
-        states = QStringList{STATE_UNHANDLED};
+        *states = QStringList{STATE_UNHANDLED};
     }
+    return true;
+}
 
-    QString startTime;
-    QString endTime;
+// The time bounds in the server's form; either may stay empty, the start not after the end.
+bool serverTimes(const QueryFilter& filter, const QDateTime& now, QString* startTime,
+                 QString* endTime, QString* errorMessage)
+{
     if (!filter.from.isEmpty() && !TimeArgument::parse(filter.from, TimeArgument::Bound::Start, now,
-                                                       filter.zone, &startTime, errorMessage))
+                                                       filter.zone, startTime, errorMessage))
         return false;
     if (!filter.to.isEmpty() && !TimeArgument::parse(filter.to, TimeArgument::Bound::End, now,
-                                                     filter.zone, &endTime, errorMessage))
+                                                     filter.zone, endTime, errorMessage))
         return false;
-    if (!startTime.isEmpty() && !endTime.isEmpty() && startTime > endTime) {
-        *errorMessage = QStringLiteral("--from %1 is after --to %2").arg(startTime, endTime);
+    if (!startTime->isEmpty() && !endTime->isEmpty() && *startTime > *endTime) {
+        *errorMessage = QStringLiteral("--from %1 is after --to %2").arg(*startTime, *endTime);
         return false;
     }
+    return true;
+}
 
+// The name and device-name rules of the filter.
+QVariantList rules(const QueryFilter& filter)
+{
     QVariantList rules;
     if (!filter.names.isEmpty())
         rules.append(QVariantMap{{ARG_RULE_TYPE, RULE_TYPE_NAME},
@@ -96,18 +110,35 @@ bool QueryArguments::build(const QueryFilter& filter, const QDateTime& now, QVar
     if (!filter.devices.isEmpty())
         rules.append(QVariantMap{{ARG_RULE_TYPE, RULE_TYPE_DEVICE_NAME},
                                  {ARG_RULE_TAG_LIST, QVariant(filter.devices)}});
+    return rules;
+}
 
+} // namespace
+
+bool QueryArguments::build(const QueryFilter& filter, const QDateTime& now, QVariantMap* args,
+                           QString* errorMessage)
+{
+    QString events;
+    QStringList states;
+    QString startTime;
+    QString endTime;
+    if (!eventElements(filter, &events, errorMessage) ||
+        !serverStates(filter, &states, errorMessage) ||
+        !serverTimes(filter, now, &startTime, &endTime, errorMessage))
+        return false;
     args->clear();
-    if (!events.isEmpty())
-        args->insert(ARG_TRIGGER_EVENT_FILTER, events);
+    const auto insertText = [args](const QString& key, const QString& text) {
+        if (!text.isEmpty())
+            args->insert(key, text);
+    };
+    insertText(ARG_TRIGGER_EVENT_FILTER, events);
     if (!states.isEmpty())
         args->insert(ARG_STATE_FILTER, stateFilter(states));
-    if (!rules.isEmpty())
-        args->insert(ARG_RULES, rules);
-    if (!startTime.isEmpty())
-        args->insert(ARG_START_TIME, startTime);
-    if (!endTime.isEmpty())
-        args->insert(ARG_END_TIME, endTime);
+    const QVariantList nameRules = rules(filter);
+    if (!nameRules.isEmpty())
+        args->insert(ARG_RULES, nameRules);
+    insertText(ARG_START_TIME, startTime);
+    insertText(ARG_END_TIME, endTime);
     return true;
 }
 
