@@ -3,6 +3,7 @@
 #include "AlarmSearchLimits.h"
 #include "DomAttributeOrder.h"
 #include "DomStyleWriter.h"
+#include "DomWalk.h"
 #include "Utf16Buffer.h"
 
 #include "XmlTextBounds.h"
@@ -22,49 +23,16 @@ bool isTextNode(const QDomNode& node)
     return node.isText(); // also true for CDATA sections, as QDomNode::save sees them
 }
 
-enum class Walk { Done, TooDeep, Stopped };
-
-// Walks the subtree below top in document order without recursion, top at level 1:
-// enter(node, level) comes before a node's children and stops the walk by returning false;
-// leave(node, level) comes after the children of a node that has some. A level deeper than
-// AlarmSearchLimits::MaxDepth stops the walk too.
-template <typename Enter, typename Leave>
-Walk walkSubtree(const QDomNode& top, Enter&& enter, Leave&& leave)
-{
-    QDomNode node = top;
-    int level = 1;
-    for (;;) {
-        if (level > AlarmSearchLimits::MaxDepth)
-            return Walk::TooDeep;
-        if (!enter(node, level))
-            return Walk::Stopped;
-        if (node.hasChildNodes()) {
-            node = node.firstChild();
-            ++level;
-            continue;
-        }
-        // Climb to the next node to enter, leaving the nodes that end on the way.
-        while (node != top && node.nextSibling().isNull()) {
-            node = node.parentNode();
-            --level;
-            leave(node, level);
-        }
-        if (node == top)
-            return Walk::Done;
-        node = node.nextSibling();
-    }
-}
-
 // Writes the subtree below a node iteratively; the walk stops at a node it does not write.
 class DomNodeWriter
 {
 public:
     explicit DomNodeWriter(Utf16Buffer& out) : m_writer(out) {}
 
-    Walk write(const QDomNode& top)
+    DomWalk::Result write(const QDomNode& top)
     {
         // Only elements among the nodes written have children, so only elements are left.
-        return walkSubtree(
+        return DomWalk::walkSubtree(
             top, [this](const QDomNode& node, int level) { return enter(node, level); },
             [this](const QDomNode& node, int level) { leaveElement(node.toElement(), level); });
     }
@@ -149,9 +117,8 @@ private:
 // recursion.
 bool withinDepth(const QDomNode& node)
 {
-    return walkSubtree(
-               node, [](const QDomNode&, int) { return true; }, [](const QDomNode&, int) {}) !=
-           Walk::TooDeep;
+    return DomWalk::walkSubtree(node, [](const QDomNode&, int) { return true; }) !=
+           DomWalk::Result::TooDeep;
 }
 
 QString savedByDom(const QDomNode& node)
@@ -209,11 +176,11 @@ QString XmlHelper::nodeToXml(const QDomNode& node)
         return QString();
     Utf16Buffer xml;
     switch (DomNodeWriter(xml).write(node)) {
-    case Walk::Done:
+    case DomWalk::Result::Done:
         return xml.view().toString();
-    case Walk::TooDeep:
+    case DomWalk::Result::TooDeep:
         return QString();
-    case Walk::Stopped:
+    case DomWalk::Result::Stopped:
         break;
     }
     return withinDepth(node) ? savedByDom(node) : QString();

@@ -2,6 +2,7 @@
 
 #include <AlarmFields.h>
 #include <AlarmSearchLimits.h>
+#include <DomWalk.h>
 #include <PluginAlarmSearchCommon.h>
 #include <XmlHelper.h>
 
@@ -111,25 +112,15 @@ QVariantList listArgument(const QVariant& value)
 
 // Removes the processing instructions inside element. They address a parser, not the server,
 // and the DOM writes some targets that its own reader took in (U+FFFD in the name) back out in
-// a form that the reader refuses. Walks without recursion: a fragment may nest deeply.
+// a form that the reader refuses.
 void removeProcessingInstructions(const QDomElement& element)
 {
     QList<QDomNode> found;
-    QDomNode node = element.firstChild();
-    while (!node.isNull() && node != element) {
-        if (node.isProcessingInstruction()) {
+    DomWalk::walkSubtree(element, [&found](const QDomNode& node, int) {
+        if (node.isProcessingInstruction())
             found.append(node);
-        } else if (node.hasChildNodes()) {
-            node = node.firstChild();
-            continue;
-        }
-        while (node != element && node.nextSibling().isNull()) {
-            node = node.parentNode();
-        }
-        if (node != element) {
-            node = node.nextSibling();
-        }
-    }
+        return true;
+    });
     for (QDomNode& instruction : found) {
         instruction.parentNode().removeChild(instruction);
     }
