@@ -5,6 +5,7 @@
 #include "ConnectionPool.h"
 #include "DemoAlarms.h"
 #include "FieldFormats.h"
+#include "SimLogging.h"
 
 #include <AlarmFields.h>
 #include <PluginAlarmSearchCommon.h>
@@ -18,6 +19,8 @@
 #include <QStandardPaths>
 
 using namespace PluginAlarmSearchCommon;
+
+Q_LOGGING_CATEGORY(lcSim, "alarmsearch.sim")
 
 namespace AlarmServerSim {
 
@@ -96,7 +99,7 @@ CommandReply badCommand()
 
 CommandReply serverError(const QSqlQuery& query)
 {
-    qWarning("alarm server: database failure: %s", qPrintable(query.lastError().text()));
+    qCWarning(lcSim, "database failure: %s", qPrintable(query.lastError().text()));
     return {kStatusServerError, QString()};
 }
 
@@ -195,7 +198,7 @@ CommandReply AlarmServer::execute(const QString& method, const QString& commandT
     QString error;
     QSqlDatabase db = d->connections.forCurrentThread(&error);
     if (!db.isValid()) {
-        qWarning("alarm server: cannot open the database: %s", qPrintable(error));
+        qCWarning(lcSim, "cannot open the database: %s", qPrintable(error));
         return {kStatusServerError, QString()};
     }
     const QString user = operatorName.isEmpty() || operatorName.size() > kMaxOperatorName
@@ -304,7 +307,7 @@ CommandReply AlarmServer::Private::getAlarmInfo(QSqlDatabase, const XmlElement& 
                                                               "ORDER BY time, id"),
                                                &error);
     if (!alarm || !log) {
-        qWarning("alarm server: cannot prepare a statement: %s", qPrintable(error));
+        qCWarning(lcSim, "cannot prepare a statement: %s", qPrintable(error));
         return {kStatusServerError, QString()};
     }
     // Reset both when done, which ends their reads.

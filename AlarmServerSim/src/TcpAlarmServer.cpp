@@ -1,6 +1,7 @@
 #include "TcpAlarmServer.h"
 
 #include "AlarmServer.h"
+#include "SimLogging.h"
 #include "TcpFrame.h"
 
 #include <PluginAlarmSearchCommon.h>
@@ -71,7 +72,7 @@ private:
             m_buffer += m_socket->readAll();
             QString error;
             if (!firstFrameFits(&error) || !takeFrames(m_buffer, m_waiting, &error)) {
-                qWarning("alarm server: dropping a client: %s", qPrintable(error));
+                qCWarning(lcSim, "dropping a client: %s", qPrintable(error));
                 m_waiting.clear();
                 m_socket->abort();
                 return;
@@ -197,7 +198,7 @@ void TcpAlarmServer::incomingConnection(qintptr socketDescriptor)
         return;
     }
     if (m_connections >= connectionLimit()) {
-        qWarning("alarm server: refusing a client: %d connections open", m_connections);
+        qCWarning(lcSim, "refusing a client: %d connections open", m_connections);
         socket->abort();
         delete socket;
         return;
@@ -221,8 +222,8 @@ int TcpAlarmServer::connectionLimit() const
 void TcpAlarmServer::backOffAccepting(QAbstractSocket::SocketError error)
 {
     m_acceptDelayMs = qBound(kFirstAcceptDelayMs, m_acceptDelayMs * 2, kLongestAcceptDelayMs);
-    qWarning("alarm server: cannot accept a client (error %d), trying again in %d ms", int(error),
-             m_acceptDelayMs);
+    qCWarning(lcSim, "cannot accept a client (error %d), trying again in %d ms", int(error),
+              m_acceptDelayMs);
     pauseAccepting();
     m_acceptRetry.start(m_acceptDelayMs);
 }
