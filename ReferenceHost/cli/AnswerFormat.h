@@ -1,6 +1,6 @@
 #pragma once
 
-#include "HostSession.h"
+#include <HostSession.h>
 
 #include <QByteArray>
 #include <QJsonObject>

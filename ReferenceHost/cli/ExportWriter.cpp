@@ -1,9 +1,11 @@
 #include "ExportWriter.h"
 
 #include "AnswerFormat.h"
-#include "TimeArgument.h"
+
+#include <TimeArgument.h>
 
 #include <AlarmFields.h>
+
 #include <QJsonArray>
 #include <QJsonDocument>
 #include <QJsonObject>

@@ -1,6 +1,7 @@
 #include "AlarmTable.h"
 
 #include <AlarmFields.h>
+
 #include <QDateTime>
 #include <QVariantMap>
 

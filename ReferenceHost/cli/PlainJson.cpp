@@ -1,6 +1,6 @@
 #include "PlainJson.h"
 
-#include "HostSession.h"
+#include <HostSession.h>
 
 #include <AlarmFields.h>
 #include <PluginAlarmSearchCommon.h>

@@ -1,6 +1,6 @@
 #include "AlarmPager.h"
 
-#include "TimeArgument.h"
+#include <TimeArgument.h>
 
 #include <AlarmFields.h>
 #include <AlarmSearchLimits.h>

@@ -1,8 +1,8 @@
 #include "BatchRequest.h"
 
-#include "EventCatalog.h"
-#include "QueryArguments.h"
-#include "TimeArgument.h"
+#include <EventCatalog.h>
+#include <QueryArguments.h>
+#include <TimeArgument.h>
 
 #include <PluginAlarmSearchCommon.h>
 
