@@ -3,6 +3,7 @@
 #include <AlarmSearchLimits.h>
 #include <TimeArgument.h>
 
+#include <AlarmFields.h>
 #include <PluginAlarmSearchCommon.h>
 
 #include <QJsonArray>
@@ -152,7 +153,8 @@ bool search(const QJsonObject& body, bool unhandledOnly, const QDateTime& now, S
                   error) ||
         !textList(body, QStringLiteral("eventGroups"), 3, kMaxTextLength, &filter.eventGroups,
                   error) ||
-        !textList(body, QStringLiteral("states"), 4, kMaxTextLength, &filter.states, error) ||
+        !textList(body, QStringLiteral("states"), int(ALARM_STATES.size()), kMaxTextLength,
+                  &filter.states, error) ||
         !text(body, QStringLiteral("from"), kMaxTextLength, &filter.from, error) ||
         !text(body, QStringLiteral("to"), kMaxTextLength, &filter.to, error) ||
         !textList(body, QStringLiteral("names"), kMaxListItems, kMaxTextLength, &filter.names,
