@@ -4,6 +4,8 @@
 
 #include <QDomNode>
 
+#include <utility>
+
 // A walk over a DOM subtree in document order without recursion: replies and request fragments
 // may nest deeply, and a recursive walk would take one stack frame per level.
 namespace DomWalk {
