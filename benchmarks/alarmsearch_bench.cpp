@@ -246,15 +246,15 @@ BENCHMARK(BM_Xml2JsonParse)->Apply(sizes);
 void BM_ComposeQuery(benchmark::State& state)
 {
     const auto rule = [](int type, const QStringList& tags) {
-        return QVariantMap{{QStringLiteral("type"), type},
-                           {QStringLiteral("tagList"), QVariant(tags)}};
+        return QVariantMap{{ARG_RULE_TYPE, type}, {ARG_RULE_TAG_LIST, QVariant(tags)}};
     };
     const QVariantMap request{
         {ARG_TRIGGER_EVENT_FILTER, CAMERA_TRIGGER_EVENT_FILTER_STRING},
         {ARG_STATE_FILTER, QStringLiteral("<StateList><State>Unhandled</State>"
                                           "<State>Handling</State></StateList>")},
-        {ARG_RULES, QVariantList{rule(0, {"Motion at Lobby", QString::fromUtf8("Kamera Süd")}),
-                                 rule(1, {"Lobby Entrance", "Server Room & Rack"})}},
+        {ARG_RULES,
+         QVariantList{rule(RULE_TYPE_NAME, {"Motion at Lobby", QString::fromUtf8("Kamera Süd")}),
+                      rule(RULE_TYPE_DEVICE_NAME, {"Lobby Entrance", "Server Room & Rack"})}},
         {ARG_START_TIME, QStringLiteral("2026-11-20T00:00:00")},
         {ARG_END_TIME, QStringLiteral("2026-11-21T00:00:00")},
         {ARG_RELAY_PATH, QStringLiteral("relay/1")},
