@@ -23,9 +23,8 @@ const QDateTime kNow(QDate(2026, 11, 20), QTime(12, 0, 0), QTimeZone::utc());
 QVariantMap alarm(int id, const QDateTime& time)
 {
     return QVariantMap{
-        {QStringLiteral("AlarmID"), QStringLiteral("A%1").arg(id, 7, 10, QLatin1Char('0'))},
-        {QStringLiteral("ServerTime"),
-         time.toString(QStringLiteral("yyyy-MM-ddTHH:mm:ss")) + QLatin1Char('Z')}};
+        {u"AlarmID"_s, u"A%1"_s.arg(id, 7, 10, QLatin1Char('0'))},
+        {u"ServerTime"_s, time.toString(u"yyyy-MM-ddTHH:mm:ss"_s) + QLatin1Char('Z')}};
 }
 
 // A server stand-in with the real one's search rules: inclusive time bounds, newest first,
@@ -36,8 +35,7 @@ public:
     explicit FakeAlarmStore(QList<QVariantMap> alarms) : m_alarms(std::move(alarms))
     {
         std::stable_sort(m_alarms.begin(), m_alarms.end(), [](const auto& a, const auto& b) {
-            return a.value(QStringLiteral("ServerTime")).toString() >
-                   b.value(QStringLiteral("ServerTime")).toString();
+            return a.value(u"ServerTime"_s).toString() > b.value(u"ServerTime"_s).toString();
         });
     }
     bool search(const QVariantMap& args, QVariantList* page, QString*)
@@ -46,8 +44,7 @@ public:
         const QString end = args.value(ARG_END_TIME).toString();
         page->clear();
         for (const QVariantMap& alarm : std::as_const(m_alarms)) {
-            const QString time =
-                alarm.value(QStringLiteral("ServerTime")).toString().chopped(1); // drop "Z"
+            const QString time = alarm.value(u"ServerTime"_s).toString().chopped(1); // drop "Z"
             if (!end.isEmpty() && time > end)
                 continue;
             if (page->size() == AlarmPager::kMaxRecords)
@@ -75,8 +72,8 @@ private slots:
         QTest::addColumn<bool>("isEnd");
         QTest::addColumn<QString>("zone");
         QTest::addColumn<QString>("expected"); // empty: rejected
-        const QString utc = QStringLiteral("UTC");
-        const QString berlin = QStringLiteral("Europe/Berlin");
+        const QString utc = u"UTC"_s;
+        const QString berlin = u"Europe/Berlin"_s;
         QTest::newRow("full") << "2026-11-01T08:15:30" << false << utc << "2026-11-01T08:15:30";
         QTest::newRow("Z") << "2026-11-01T08:15:30Z" << true << berlin << "2026-11-01T08:15:30";
         QTest::newRow("offset") << "2026-11-01T08:15:30+02:00" << false << utc
@@ -261,55 +258,51 @@ private slots:
 
     void plainJsonTypesKnownFields()
     {
-        const QVariantMap alarm{
-            {QStringLiteral("Muted"), QStringLiteral("true")},
-            {QStringLiteral("ServerTime"), QStringLiteral("2026-11-20T08:00:00")},
-            {QStringLiteral("MuteUntil"), QString()},
-            {QStringLiteral("Note"), QStringLiteral("123")},
-            {ARG_UPDATE_RESULT, QStringLiteral("1")}};
-        const QJsonObject expected{
-            {QStringLiteral("Muted"), true},
-            {QStringLiteral("ServerTime"), QStringLiteral("2026-11-20T08:00:00Z")},
-            {QStringLiteral("MuteUntil"), QJsonValue::Null},
-            {QStringLiteral("Note"), QStringLiteral("123")},
-            {ARG_UPDATE_RESULT, 1}};
+        const QVariantMap alarm{{u"Muted"_s, u"true"_s},
+                                {u"ServerTime"_s, u"2026-11-20T08:00:00"_s},
+                                {u"MuteUntil"_s, QString()},
+                                {u"Note"_s, u"123"_s},
+                                {ARG_UPDATE_RESULT, u"1"_s}};
+        const QJsonObject expected{{u"Muted"_s, true},
+                                   {u"ServerTime"_s, u"2026-11-20T08:00:00Z"_s},
+                                   {u"MuteUntil"_s, QJsonValue::Null},
+                                   {u"Note"_s, u"123"_s},
+                                   {ARG_UPDATE_RESULT, 1}};
         const QJsonValue plain = PlainJson::value(QVariantList{alarm});
         QCOMPARE(plain, QJsonValue(QJsonArray{expected}));
         // Typed values stay as they are, as when a remote host's answer is printed again.
         QCOMPARE(PlainJson::value(plain.toVariant()), plain);
-        QCOMPARE(PlainJson::time(QStringLiteral("2026-11-20T10:00:00+02:00")),
-                 QJsonValue(QStringLiteral("2026-11-20T08:00:00Z")));
+        QCOMPARE(PlainJson::time(u"2026-11-20T10:00:00+02:00"_s),
+                 QJsonValue(u"2026-11-20T08:00:00Z"_s));
     }
 
     void csvQuotesGuardsAndRepeatsAlarmFields()
     {
-        const QVariantMap fields{
-            {QStringLiteral("AlarmID"), QStringLiteral("A0000001")},
-            {QStringLiteral("AlarmName"), QStringLiteral("Gate, \"north\"")},
-            {QStringLiteral("ServerTime"), QStringLiteral("2026-11-20T08:00:00Z")},
-            {QStringLiteral("Note"), QStringLiteral("=HYPERLINK(\"x\")")}};
+        const QVariantMap fields{{u"AlarmID"_s, u"A0000001"_s},
+                                 {u"AlarmName"_s, u"Gate, \"north\""_s},
+                                 {u"ServerTime"_s, u"2026-11-20T08:00:00Z"_s},
+                                 {u"Note"_s, u"=HYPERLINK(\"x\")"_s}};
         const QVariantList history{
-            QVariantMap{{QStringLiteral("State"), QStringLiteral("Unhandled")}},
-            QVariantMap{{QStringLiteral("State"), QStringLiteral("Handled")},
-                        {QStringLiteral("Note"), QStringLiteral("two\nlines")}}};
+            QVariantMap{{u"State"_s, u"Unhandled"_s}},
+            QVariantMap{{u"State"_s, u"Handled"_s}, {u"Note"_s, u"two\nlines"_s}}};
         ExportWriter::Options options;
         options.byteOrderMark = true;
-        options.zone = TimeArgument::zoneNamed(QStringLiteral("+01:00"));
+        options.zone = TimeArgument::zoneNamed(u"+01:00"_s);
         ExportWriter writer(options);
         const QByteArray bytes = writer.begin() + writer.alarm(ExportedAlarm{fields, history}) +
                                  writer.alarm(ExportedAlarm{fields, QVariantList()}) + writer.end();
         QVERIFY(bytes.startsWith("\xEF\xBB\xBF"
                                  "AlarmID,"));
         const QString csv = QString::fromUtf8(bytes.mid(3));
-        const QStringList rows = csv.split(QStringLiteral("\r\n"), Qt::SkipEmptyParts);
+        const QStringList rows = csv.split(u"\r\n"_s, Qt::SkipEmptyParts);
         QCOMPARE(rows.size(), 4);
         QCOMPARE(rows[0], ExportWriter::csvColumns().join(u','));
         const QString alarm = QStringLiteral("A0000001,,,,\"Gate, \"\"north\"\"\",,,"
                                              "2026-11-20T09:00:00+01:00,"
                                              "\"'=HYPERLINK(\"\"x\"\")\",,,");
-        QCOMPARE(rows[1], alarm + QStringLiteral(",Unhandled,,"));
-        QCOMPARE(rows[2], alarm + QStringLiteral(",Handled,\"two\nlines\","));
-        QCOMPARE(rows[3], alarm + QStringLiteral(",,,"));
+        QCOMPARE(rows[1], alarm + u",Unhandled,,"_s);
+        QCOMPARE(rows[2], alarm + u",Handled,\"two\nlines\","_s);
+        QCOMPARE(rows[3], alarm + u",,,"_s);
 
         // A leading =, +, -, @, tab or carriage return is guarded, unless raw.
         const QStringList values{u"=1+2"_s, u"+1"_s,  u"-1"_s, u"@SUM(A1)"_s,
@@ -348,36 +341,32 @@ private slots:
         QJsonParseError error;
         const QJsonObject answer = QJsonDocument::fromJson(out, &error).object();
         QCOMPARE(error.error, QJsonParseError::NoError);
-        QCOMPARE(answer.value(QLatin1String("method")).toString(), METHOD_QUERY_UNHANDLED_ALARM);
-        QCOMPARE(answer.value(QLatin1String("truncated")).toBool(), true);
+        QCOMPARE(answer.value("method"_L1).toString(), METHOD_QUERY_UNHANDLED_ALARM);
+        QCOMPARE(answer.value("truncated"_L1).toBool(), true);
         const QJsonArray alarms =
-            answer.value(QLatin1String("result")).toObject().value(ARG_QUERY_RESULT).toArray();
+            answer.value("result"_L1).toObject().value(ARG_QUERY_RESULT).toArray();
         QCOMPARE(alarms.size(), 2 * pages);
         if (pages > 0)
-            QCOMPARE(alarms.last().toObject().value(QLatin1String("AlarmID")).toString(),
-                     QStringLiteral("A0000004"));
+            QCOMPARE(alarms.last().toObject().value("AlarmID"_L1).toString(), u"A0000004"_s);
     }
 
     void tableFitsWidthByDisplayWidth()
     {
         QVariantMap wide = alarm(1, kNow);
-        wide.insert(QStringLiteral("AlarmName"),
-                    QStringLiteral("正門の動き検知 🚨 at the main gate"));
-        wide.insert(QStringLiteral("Note"), QStringLiteral("Cafe\u0301 checked, all fine"));
+        wide.insert(u"AlarmName"_s, u"正門の動き検知 🚨 at the main gate"_s);
+        wide.insert(u"Note"_s, u"Cafe\u0301 checked, all fine"_s);
         QVariantMap plain = alarm(2, kNow.addSecs(-60));
-        plain.insert(QStringLiteral("AlarmName"), QStringLiteral("Motion"));
+        plain.insert(u"AlarmName"_s, u"Motion"_s);
         for (QVariantMap* fields : {&wide, &plain})
-            fields->insert(QStringLiteral("Muted"), QStringLiteral("false"));
-        QCOMPARE(AlarmTable::displayWidth(QStringLiteral("正門🚨e\u0301")), 7);
-        AlarmTable table(TimeArgument::zoneNamed(QStringLiteral("+01:00")), 72);
+            fields->insert(u"Muted"_s, u"false"_s);
+        QCOMPARE(AlarmTable::displayWidth(u"正門🚨e\u0301"_s), 7);
+        AlarmTable table(TimeArgument::zoneNamed(u"+01:00"_s), 72);
         const QStringList lines =
             table.page({wide, plain}).split(QLatin1Char('\n'), Qt::SkipEmptyParts);
         QCOMPARE(lines.size(), 3);
-        QVERIFY2(lines[0].startsWith(QStringLiteral("ALARM     TIME (UTC+01:00)     ")),
-                 qPrintable(lines[0]));
-        QVERIFY2(lines[2].startsWith(QStringLiteral("A0000002  2026-11-20 12:59:00  ")),
-                 qPrintable(lines[2]));
-        QVERIFY(lines[1].contains(QStringLiteral("…")));
+        QVERIFY2(lines[0].startsWith(u"ALARM     TIME (UTC+01:00)     "_s), qPrintable(lines[0]));
+        QVERIFY2(lines[2].startsWith(u"A0000002  2026-11-20 12:59:00  "_s), qPrintable(lines[2]));
+        QVERIFY(lines[1].contains(u"…"_s));
         // MUTED starts at the same display column in every line, wide characters or not.
         const auto mutedColumn = [](const QString& line, const char* text) {
             return AlarmTable::displayWidth(line.left(line.indexOf(QLatin1String(text))));
@@ -406,22 +395,20 @@ private slots:
              {ARG_TRIGGER_EVENT_FILTER, QStringLiteral("<Event CameraEvent=\"Motion\">CamEvent"
                                                        "</Event>") +
                                             SYSTEM_TRIGGER_EVENT_FILTER_STRING},
-             {ARG_START_TIME, QStringLiteral("2026-11-01T08:00:00")},
-             {ARG_END_TIME, QStringLiteral("2026-11-19T12:00:00")}});
+             {ARG_START_TIME, u"2026-11-01T08:00:00"_s},
+             {ARG_END_TIME, u"2026-11-19T12:00:00"_s}});
         row("raw fragments",
             R"({"method":"QryUnhandledAlarm","args":{"stateFilter":"<AlarmStateList/>",)"
             R"("rules":[{"type":1,"tagList":["Dock"]}]}})",
-            {{ARG_STATE_FILTER, QStringLiteral("<AlarmStateList/>")},
-             {ARG_RULES, QVariantList{QVariantMap{
-                             {QStringLiteral("type"), 1},
-                             {QStringLiteral("tagList"), QStringList{QStringLiteral("Dock")}}}}}});
+            {{ARG_STATE_FILTER, u"<AlarmStateList/>"_s},
+             {ARG_RULES,
+              QVariantList{QVariantMap{{u"type"_s, 1}, {u"tagList"_s, QStringList{u"Dock"_s}}}}}});
         row("update",
             R"({"method":"UpdateAlarm","args":{"alarmIdList":"A1","alarmStatus":"handled"}})",
-            {{ARG_ALARM_ID_LIST, QStringList{QStringLiteral("A1")}},
-             {ARG_ALARM_STATUS, QStringLiteral("Handled")}});
+            {{ARG_ALARM_ID_LIST, QStringList{u"A1"_s}}, {ARG_ALARM_STATUS, u"Handled"_s}});
         row("mute",
             R"({"method":"MuteAlarm","args":{"alarmIdList":["A1"],"isMute":true,"muteTimeSecond":60}})",
-            {{ARG_ALARM_ID_LIST, QStringList{QStringLiteral("A1")}},
+            {{ARG_ALARM_ID_LIST, QStringList{u"A1"_s}},
              {ARG_IS_MUTE, true},
              {ARG_MUTE_TIME_SECOND, 60}});
         row("unknown key", R"({"method":"QryAlarmList","args":{"from":"7d","bogus":1}})", {},
