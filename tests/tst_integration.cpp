@@ -40,42 +40,6 @@ QStringList ids(const QVariantList& alarms)
     return out;
 }
 
-// Records each event as "subscription event relay path: id state result, ...".
-class EventLog
-{
-public:
-    EventHub::Listener listener(const QString& key)
-    {
-        return [this, key](const PluginObjBase_EventSignalInfo& info) {
-            const QVariantMap data = info.eventData.toMap();
-            QStringList results;
-            for (const QVariant& result : data.value(ARG_ALARM_UPDATED_RESULTS).toList()) {
-                const QVariantMap entry = result.toMap();
-                results.append(QStringList{entry.value(ARG_ALARM_ID).toString(),
-                                           entry.value(ARG_ALARM_STATUS).toString(),
-                                           entry.value(ARG_UPDATE_RESULT).toString()}
-                                   .join(u' '));
-            }
-            results.sort();
-            QMutexLocker locker(&m_mutex);
-            m_lines.append(
-                QStringList{key, info.eventName, data.value(ARG_RELAY_PATH).toString()}.join(u' ') +
-                u": "_s + results.join(u", "_s));
-        };
-    }
-    QStringList lines()
-    {
-        QMutexLocker locker(&m_mutex);
-        QStringList sorted = m_lines;
-        sorted.sort();
-        return sorted;
-    }
-
-private:
-    QMutex m_mutex;
-    QStringList m_lines;
-};
-
 // Runs a program to its end: exit code, standard output and standard error.
 struct Run
 {
@@ -244,9 +208,17 @@ private slots:
             QCOMPARE(ids(search(c.args, c.method)), ids(wanted));
         }
 
-        EventLog events;
-        for (const QString& key : {u"first"_s, u"second"_s, u"gone"_s})
-            session.subscribe(key, EVENT_ALARM_UPDATED, events.listener(key));
+        QMutex mutex;
+        QStringList events; // "subscription event data as JSON"
+        for (const QString& key : {u"first"_s, u"second"_s, u"gone"_s}) {
+            session.subscribe(
+                key, EVENT_ALARM_UPDATED, [&, key](const PluginObjBase_EventSignalInfo& info) {
+                    QMutexLocker locker(&mutex);
+                    events.append(key + u' ' + info.eventName + u' ' +
+                                  QString::fromUtf8(QJsonDocument::fromVariant(info.eventData)
+                                                        .toJson(QJsonDocument::Compact)));
+                });
+        }
         session.unsubscribe(u"gone"_s);
         const QString note = u"Cat & dog <again>"_s;
         const PluginAnswer answer =
@@ -256,9 +228,15 @@ private slots:
                                        {ARG_RELAY_PATH, u"relay/7"_s}});
         QVERIFY(answer.isLast);
         QCOMPARE(answer.resultCode, u"0"_s);
-        const QString results =
-            u" AlarmUpdated relay/7: A0000001 FalseAlarm 0, A0000002 FalseAlarm 0, A9999999 FalseAlarm 1"_s;
-        QCOMPARE(events.lines(), (QStringList{u"first"_s + results, u"second"_s + results}));
+        const auto result = [](const char* id, const char* code) {
+            return uR"({"alarmId":"%1","alarmStatus":"FalseAlarm","updateResult":"%2"})"_s.arg(
+                QLatin1String(id), QLatin1String(code));
+        };
+        const QString data =
+            uR"( AlarmUpdated {"alarmUpdatedResults":[%1,%2,%3],"relayPath":"relay/7"})"_s.arg(
+                result("A0000002", "0"), result("A0000001", "0"), result("A9999999", "1"));
+        events.sort();
+        QCOMPARE(events, (QStringList{u"first"_s + data, u"second"_s + data}));
         const PluginAnswer history =
             call(METHOD_GET_ALARM_HISTORY, {{ARG_ALARM_ID, u"A0000001"_s}});
         QCOMPARE(history.resultCode, u"0"_s);
