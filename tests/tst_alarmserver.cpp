@@ -311,12 +311,9 @@ private slots:
         QCOMPARE(after, before + QList<AlarmFields>{entry});
 
         // Without a Status the state stays; the note and the log still change.
-        QCOMPARE(m_server
-                     ->execute(u"ProcessAlarm"_s,
-                               u"<ProcessAlarm><AlarmList><Alarm ID=\"%1\"/></AlarmList>"
-                               "<Note>second look</Note></ProcessAlarm>"_s.arg(first))
-                     .statusText,
-                 u"0"_s);
+        const QString noteOnly = u"<ProcessAlarm><AlarmList><Alarm ID=\"%1\"/></AlarmList>"
+                                 "<Note>second look</Note></ProcessAlarm>"_s.arg(first);
+        QCOMPARE(m_server->execute(u"ProcessAlarm"_s, noteOnly).statusText, u"0"_s);
         QCOMPARE(info(*m_server, first, u"Alarm"_s).first()["State"], u"Handled"_s);
         QCOMPARE(info(*m_server, first, u"Entry"_s).last()["Note"], u"second look"_s);
 
@@ -353,37 +350,31 @@ private slots:
         QString attributes;
         for (int i = 0; i < 80000; ++i)
             attributes += u" a%1=''"_s.arg(i);
-        const QString bad = u"80000001"_s;
-        QTest::newRow("not XML") << "QryAlarmList"
-                                 << "<QryAlarmList><Filters>" << bad;
-        QTest::newRow("empty") << "GetAlarmInfo"
-                               << "" << bad;
-        QTest::newRow("root of another command")
-            << "GetAlarmInfo"
-            << "<MuteAlarm><Mute>false</Mute></MuteAlarm>" << bad;
-        QTest::newRow("DTD") << "GetAlarmInfo"
-                             << "<!DOCTYPE GetAlarmInfo [<!ENTITY id \"A0000001\">]>"
-                                "<GetAlarmInfo><AlarmID>&id;</AlarmID></GetAlarmInfo>"
-                             << bad;
-        QTest::newRow("bad time") << "QryAlarmList"
-                                  << queryCommand(QString(), u"2026-13-01T00:00:00"_s) << bad;
-        QTest::newRow("unknown state")
-            << "ProcessAlarm" << processCommand({u"A0000001"_s}, u"Done"_s, QString()) << bad;
-        QTest::newRow("mute flag")
-            << "MuteAlarm" << muteCommand({u"A0000001"_s}, true, 5).replace(u">true<"_s, u">yes<"_s)
-            << bad;
+        const auto row = [](const char* name, const char* method, const QString& command,
+                            const char* status = "80000001") {
+            QTest::newRow(name) << QString::fromLatin1(method) << command
+                                << QString::fromLatin1(status);
+        };
+        row("not XML", "QryAlarmList", u"<QryAlarmList><Filters>"_s);
+        row("empty", "GetAlarmInfo", QString());
+        row("root of another command", "GetAlarmInfo",
+            u"<MuteAlarm><Mute>false</Mute></MuteAlarm>"_s);
+        row("DTD", "GetAlarmInfo",
+            u"<!DOCTYPE GetAlarmInfo [<!ENTITY id \"A0000001\">]>"
+            "<GetAlarmInfo><AlarmID>&id;</AlarmID></GetAlarmInfo>"_s);
+        row("bad time", "QryAlarmList", queryCommand(QString(), u"2026-13-01T00:00:00"_s));
+        row("unknown state", "ProcessAlarm", processCommand({u"A0000001"_s}, u"Done"_s, QString()));
+        row("mute flag", "MuteAlarm",
+            muteCommand({u"A0000001"_s}, true, 5).replace(u">true<"_s, u">yes<"_s));
         // The parsed tree's destructor recursed once per level: 400 000 levels crashed.
-        QTest::newRow("nested 257 levels") << "GetAlarmInfo"
-                                           << "<GetAlarmInfo>" + u"<e>"_s.repeated(256) +
-                                                  u"</e>"_s.repeated(256) + "</GetAlarmInfo>"
-                                           << bad;
-        QTest::newRow("nested 400000 levels")
-            << "QryAlarmList"
-            << "<QryAlarmList><Filters>" + u"<e>"_s.repeated(400000) << bad;
-        QTest::newRow("80000 attributes") << "GetAlarmInfo"
-                                          << "<GetAlarmInfo" + attributes + "/>" << bad;
-        QTest::newRow("unknown method") << "QryAlarms" << queryCommand() << "80000002";
-        QTest::newRow("method in another case") << "qryalarmlist" << queryCommand() << "80000002";
+        row("nested 257 levels", "GetAlarmInfo",
+            "<GetAlarmInfo>" + u"<e>"_s.repeated(256) + u"</e>"_s.repeated(256) +
+                "</GetAlarmInfo>");
+        row("nested 400000 levels", "QryAlarmList",
+            "<QryAlarmList><Filters>" + u"<e>"_s.repeated(400000));
+        row("80000 attributes", "GetAlarmInfo", "<GetAlarmInfo" + attributes + "/>");
+        row("unknown method", "QryAlarms", queryCommand(), "80000002");
+        row("method in another case", "qryalarmlist", queryCommand(), "80000002");
     }
 
     void badCommands()
