@@ -263,7 +263,8 @@ private slots:
         }
     }
 
-    // With a users file, tokens name the operators, and the history shows who changed what.
+    // With a users file, tokens name the operators (the browser test sees the name in a history);
+    // without a known token, nothing but the API description is served.
     void tokensNameOperators()
     {
         QTemporaryFile users;
@@ -277,16 +278,6 @@ private slots:
         QCOMPARE(request(server.url, "GET", u"/api/v1/me"_s, {}, u"wrong-token-0123456"_s).status,
                  401);
         QCOMPARE(request(server.url, "GET", ApiRoutes::kOpenApiPath).status, 200);
-        QCOMPARE(request(server.url, "POST", u"/api/v1/alarms/update"_s,
-                         R"({"ids":["A0000005"],"state":"Handled","note":"seen"})", kAliceToken)
-                     .status,
-                 200);
-        const QJsonArray entries =
-            request(server.url, "GET", u"/api/v1/alarms/A0000005/history"_s, {}, kAliceToken)
-                .body.value("entries"_L1)
-                .toArray();
-        QCOMPARE(entries.last().toObject().value("User"_L1).toString(), u"alice"_s);
-
         Events refused(server.url, u"wrong-token-0123456"_s);
         Events accepted(server.url, kAliceToken);
         QTRY_COMPARE_WITH_TIMEOUT(int(refused.socket.closeCode()), 4401, kWaitMs);
