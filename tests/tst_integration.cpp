@@ -398,6 +398,7 @@ private slots:
         // Help anywhere runs nothing; the first real use seeds the database and says so.
         QVERIFY(onDb(u"update A0000001 --state FalseAlarm --help-all"_s)
                     .out.startsWith("Usage: alarmsearch update"));
+        QVERIFY(onDb(u"--help-all"_s).out.startsWith("Usage: alarmsearch"));
         QVERIFY(!QFile::exists(db));
         const Run capped = onDb(u"query --format json"_s);
         QVERIFY2(capped.err.startsWith("created the database " + db.toUtf8()), capped.err.data());
