@@ -1,31 +1,21 @@
 // What the console's browser tests share: a real `alarmsearch serve` on a loopback port and
 // Debian's Chromium driven by playwright-core.
 
-import { spawn, execFile } from 'node:child_process';
-import { mkdtempSync, mkdirSync, rmSync, writeFileSync } from 'node:fs';
+import { spawn } from 'node:child_process';
+import { mkdtempSync, mkdirSync, rmSync } from 'node:fs';
 import { tmpdir } from 'node:os';
 import { join } from 'node:path';
-import { promisify } from 'node:util';
 
 export const alarmsearch = process.env.ALARMSEARCH_BIN;
 if (!alarmsearch) throw new Error('set ALARMSEARCH_BIN to the alarmsearch executable (CTest does)');
 export const screenshots = process.env.ALARMSEARCH_SCREENSHOTS || join(tmpdir(), 'console-shots');
 mkdirSync(screenshots, { recursive: true });
 
-let chromium;
-try {
-  ({ chromium } = await import('playwright-core'));
-} catch {
+const { chromium } = await import('playwright-core').catch(() => {
   throw new Error('playwright-core is missing: run scripts/setup.sh (npm ci) first');
-}
+});
 
 export const scratch = () => mkdtempSync(join(tmpdir(), 'console-test-'));
-
-export function usersFile(dir, users) {
-  const file = join(dir, 'users.json');
-  writeFileSync(file, JSON.stringify({ users }));
-  return file;
-}
 
 // Starts serve with an in-memory simulator; resolves once it prints the URL it listens on.
 export function startServe({ port = 0, users = null } = {}) {
@@ -60,9 +50,6 @@ export function startServe({ port = 0, users = null } = {}) {
   });
 }
 
-export const runCli = (args, env = {}) =>
-  promisify(execFile)(alarmsearch, args, { env: { ...process.env, ...env }, timeout: 20000 });
-
 // A fresh profile for each browser, removed when it closes.
 export async function launchBrowser() {
   const profile = scratch();
@@ -74,13 +61,8 @@ export async function launchBrowser() {
     args: ['--headless', '--no-sandbox', '--disable-gpu', '--disable-quic', '--no-first-run',
            '--disable-background-networking', '--disable-component-update', '--disable-sync'],
   });
-  context.on('close', () => {
-    try {
-      rmSync(profile, { recursive: true, force: true, maxRetries: 5 });
-    } catch {
-      // Chromium may still be writing it; a profile left in the temporary folder does no harm.
-    }
-  });
+  // Chromium may still be writing it; a profile left in the temporary folder does no harm.
+  context.on('close', () => { try { rmSync(profile, { recursive: true, force: true }); } catch {} });
   return context;
 }
 
@@ -100,8 +82,6 @@ export async function signIn(page, url, token) {
   await page.getByLabel('Access token').press('Enter');
   await page.locator('#live-status.on').waitFor();
 }
-
-export const row = (page, id) => page.locator(`#alarms tbody tr[data-id="${id}"]`);
 
 export async function rowIds(page) {
   return page.locator('#alarms tbody tr').evaluateAll((rows) => rows.map((r) => r.dataset.id));
