@@ -162,13 +162,6 @@ private slots:
         const QVariant sample = all[0];
         const QString eventClass = field(sample, "EventClass");
         const QString subEvent = field(sample, "SubEvent");
-        const QString nameWord = field(sample, "AlarmName").section(u' ', -1).toUpper();
-        const QString device = field(sample, "DeviceName");
-        const QString from = field(all[200], "ServerTime").chopped(1);
-        const QString to = field(all[100], "ServerTime").chopped(1);
-        const auto rule = [](int type, const QString& tag) {
-            return QVariantList{QVariantMap{{u"type"_s, type}, {u"tagList"_s, QStringList{tag}}}};
-        };
         const struct
         {
             QString method;
@@ -182,20 +175,6 @@ private slots:
                                         field(sample, "SubEventType"), subEvent, eventClass)}},
              [&](const QVariant& a) {
                  return field(a, "EventClass") == eventClass && field(a, "SubEvent") == subEvent;
-             }},
-            {METHOD_QUERY_ALARM_LIST,
-             {{ARG_RULES, rule(0, nameWord)}},
-             [&](const QVariant& a) {
-                 return field(a, "AlarmName").contains(nameWord, Qt::CaseInsensitive);
-             }},
-            {METHOD_QUERY_ALARM_LIST,
-             {{ARG_RULES, rule(1, device)}},
-             [&](const QVariant& a) { return field(a, "DeviceName") == device; }},
-            {METHOD_QUERY_ALARM_LIST,
-             {{ARG_START_TIME, from}, {ARG_END_TIME, to}},
-             [&](const QVariant& a) {
-                 const QString time = field(a, "ServerTime").chopped(1);
-                 return time >= from && time <= to;
              }},
             {METHOD_QUERY_UNHANDLED_ALARM,
              {{ARG_STATE_FILTER, u"<AlarmStateList><State>Unhandled</State></AlarmStateList>"_s}},
@@ -253,22 +232,6 @@ private slots:
             QVERIFY(m_host->tunnelClient().waitForIdle(kTimeoutMs));
             QCOMPARE(field(search(QVariantMap())[3], "Muted"), mute ? u"true"_s : u"false"_s);
         }
-    }
-
-    void lostServerAnswersFailure()
-    {
-        openHost(u"tcp"_s);
-        m_simulator->kill();
-        m_simulator->waitForFinished();
-        // Refused at once or answered as failed once the loss is noticed; never a hang.
-        const PluginAnswer answer = call(METHOD_QUERY_ALARM_LIST, QVariantMap());
-        QVERIFY(answer.resultCode != "0"_L1);
-        QVERIFY(AnswerFormat::alarms(answer, true).isEmpty());
-        QCOMPARE(call(METHOD_GET_ALARM_HISTORY, {{ARG_ALARM_ID, u"A0000001"_s}}).resultCode,
-                 u"-1"_s);
-        const QString error = m_host->tunnelClient().connectionError();
-        QVERIFY2(error.startsWith(u"connection to 127.0.0.1:"_s) && error.endsWith(u" lost"_s),
-                 qPrintable(error));
     }
 
     // Out of file descriptors, the simulator spun at full load, dropped its clients and died.

@@ -170,6 +170,7 @@ private slots:
         server.disconnectClient();
         QVERIFY(server.client.waitForIdle(5000));
         QVERIFY(!sink.send(server.client, kWithReply, u"QryAlarmList"_s, u"<C/>"_s));
+        QVERIFY(server.client.connectionError().endsWith(u" lost"_s));
         const QStringList replies = sink.replies();
         QCOMPARE(replies.size(), 2);
         QVERIFY2(replies[0].startsWith(u"failed"_s), qPrintable(replies[0]));
