@@ -148,49 +148,45 @@ private slots:
         QTest::addColumn<QString>("end");
         QTest::addColumn<AlarmPredicate>("matches");
 
+        // Name, the filters (after an empty event list unless they start with one), full-match
+        // patterns of the fields of every alarm listed.
+        const auto row =
+            [](const char* name, const QString& filters,
+               const QList<QPair<const char*, QString>>& patterns) {
+                QTest::newRow(name)
+                    << (filters.startsWith("<Trigger"_L1) ? "" : "<TriggerEventList/>") + filters
+                    << ""
+                    << "" << fieldsMatch(patterns);
+            };
         const auto events = [](const QString& fragment) {
             return u"<TriggerEventList>%1</TriggerEventList>"_s.arg(fragment);
         };
-        QTest::newRow("camera filter")
-            << events(CAMERA_TRIGGER_EVENT_FILTER_STRING) << ""
-            << "" << fieldsMatch({{"EventClass", "CamEvent|VCA|CamConn|RecStatus|RecErr"}});
-        QTest::newRow("system filter")
-            << events(SYSTEM_TRIGGER_EVENT_FILTER_STRING) << ""
-            << ""
-            << fieldsMatch(
-                   {{"SubEvent", ""},
-                    {"EventClass", "StationConn|StorageConn|StorageCapacity|SysLicense|"
-                                   "SysNetwork|SysVirMem|FanStatus|GpsConn|GpsSpeed|Gsensor|"
-                                   "SysVcaAreaReport|BruteForceAttack|CyberAttack|"
-                                   "QuarantineEvent"}});
-        QTest::newRow("external device filter")
-            << events(EXTERNAL_DEVICE_TRIGGER_EVENT_FILTER_STRING) << ""
-            << ""
-            << fieldsMatch({{"EventClass", "ExtIODevice|DIOStatus|ExtTCPMessage|ExtDataMagnet|"
-                                           "ExtAccessRule|VirtualTrigger|ManualEvent"}});
-        QTest::newRow("states") << "<TriggerEventList/><AlarmStateList><State>Processing</State>"
-                                   "<State>FalseAlarm</State></AlarmStateList>"
-                                << ""
-                                << "" << fieldsMatch({{"State", "Processing|FalseAlarm"}});
-        QTest::newRow("empty state list") << "<TriggerEventList/><AlarmStateList/>"
-                                          << ""
-                                          << "" << fieldsMatch({});
-        QTest::newRow("percent-encoded name, any case")
-            << "<TriggerEventList/><NameList><Name>LINE%20crossing</Name>"
-               "<Name>Intrusion%20at</Name></NameList>"
-            << ""
-            << "" << fieldsMatch({{"AlarmName", ".*(Line Crossing|Intrusion at).*"}});
-        QTest::newRow("two name lists must both hold")
-            << "<TriggerEventList/><NameList><Name>Motion</Name><Name>Loitering</Name></NameList>"
-               "<NameList><Name>Parking</Name></NameList>"
-            << ""
-            << "" << fieldsMatch({{"AlarmName", "(?=.*(Motion|Loitering)).*Parking.*"}});
-        QTest::newRow("device names, any case, whole name")
-            << "<TriggerEventList/><TriggerDeviceNameList><DeviceName>lobby ENTRANCE</DeviceName>"
-               "<DeviceName>Recording Server 01</DeviceName><DeviceName>Server</DeviceName>"
-               "</TriggerDeviceNameList>"
-            << ""
-            << "" << fieldsMatch({{"DeviceName", "Lobby Entrance|Recording Server 01"}});
+        row("camera filter", events(CAMERA_TRIGGER_EVENT_FILTER_STRING),
+            {{"EventClass", "CamEvent|VCA|CamConn|RecStatus|RecErr"}});
+        row("system filter", events(SYSTEM_TRIGGER_EVENT_FILTER_STRING),
+            {{"SubEvent", ""},
+             {"EventClass", "StationConn|StorageConn|StorageCapacity|SysLicense|SysNetwork|"
+                            "SysVirMem|FanStatus|GpsConn|GpsSpeed|Gsensor|SysVcaAreaReport|"
+                            "BruteForceAttack|CyberAttack|QuarantineEvent"}});
+        row("external device filter", events(EXTERNAL_DEVICE_TRIGGER_EVENT_FILTER_STRING),
+            {{"EventClass", "ExtIODevice|DIOStatus|ExtTCPMessage|ExtDataMagnet|ExtAccessRule|"
+                            "VirtualTrigger|ManualEvent"}});
+        row("states",
+            u"<AlarmStateList><State>Processing</State><State>FalseAlarm</State>"
+            "</AlarmStateList>"_s,
+            {{"State", "Processing|FalseAlarm"}});
+        row("empty state list", u"<AlarmStateList/>"_s, {});
+        row("percent-encoded name, any case",
+            u"<NameList><Name>LINE%20crossing</Name><Name>Intrusion%20at</Name></NameList>"_s,
+            {{"AlarmName", ".*(Line Crossing|Intrusion at).*"}});
+        row("two name lists must both hold",
+            u"<NameList><Name>Motion</Name><Name>Loitering</Name></NameList>"
+            "<NameList><Name>Parking</Name></NameList>"_s,
+            {{"AlarmName", "(?=.*(Motion|Loitering)).*Parking.*"}});
+        row("device names, any case, whole name",
+            u"<TriggerDeviceNameList><DeviceName>lobby ENTRANCE</DeviceName><DeviceName>Recording "
+            "Server 01</DeviceName><DeviceName>Server</DeviceName></TriggerDeviceNameList>"_s,
+            {{"DeviceName", "Lobby Entrance|Recording Server 01"}});
         // Each list is one bound value: SQLite refused 1000 or more parameters. The event
         // with a sub-event restricts the class to that sub-event.
         const auto many = [](const char* list, const char* item, const QString& last) {
@@ -203,17 +199,15 @@ private slots:
         const AlarmFields motion =
             *std::find_if(m_all.begin(), m_all.end(),
                           [](const AlarmFields& a) { return a["SubEvent"] == "Motion"_L1; });
-        QTest::newRow("5001 events, names and device names")
-            << many("TriggerEventList", "Event", u"CamEvent"_s)
-                       .replace(u"<Event>CamEvent"_s, u"<Event CameraEvent=\"Motion\">CamEvent"_s) +
-                   many("NameList", "Name", u"%20"_s) +
-                   many("TriggerDeviceNameList", "DeviceName", motion["DeviceName"])
-            << ""
-            << ""
-            << fieldsMatch({{"EventClass", "CamEvent"},
-                            {"SubEvent", "Motion"},
-                            {"AlarmName", ".* .*"},
-                            {"DeviceName", QRegularExpression::escape(motion["DeviceName"])}});
+        row("5001 events, names and device names",
+            many("TriggerEventList", "Event", u"CamEvent"_s)
+                    .replace(u"<Event>CamEvent"_s, u"<Event CameraEvent=\"Motion\">CamEvent"_s) +
+                many("NameList", "Name", u"%20"_s) +
+                many("TriggerDeviceNameList", "DeviceName", motion["DeviceName"]),
+            {{"EventClass", "CamEvent"},
+             {"SubEvent", "Motion"},
+             {"AlarmName", ".* .*"},
+             {"DeviceName", QRegularExpression::escape(motion["DeviceName"])}});
         QTest::newRow("time bound, both ends inclusive")
             << "" << m_all.at(300)["ServerTime"].chopped(1) << m_all.at(100)["ServerTime"]
             << AlarmPredicate([this](const AlarmFields& a) {
