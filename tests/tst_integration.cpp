@@ -288,13 +288,32 @@ private slots:
             QVERIFY(probe.listen(QHostAddress::LocalHost));
             closedPort = probe.serverPort();
         }
+        // A first word "sim" runs the simulator, one that sets ALARMSEARCH_PLUGIN runs the CLI
+        // in that environment.
         const auto row = [](const char* name, const QString& arguments, int exitCode,
                             const QString& output, const QByteArray& input = {}) {
-            const bool sim = arguments.startsWith(u"sim "_s);
-            QTest::newRow(name) << (sim ? QStringLiteral(ALARMSEARCH_SIM_EXE) : QString())
-                                << words(sim ? arguments.mid(4) : arguments) << input << exitCode
-                                << output;
+            QStringList argv = words(arguments);
+            QString program;
+            if (argv.first() == "sim"_L1)
+                program = QStringLiteral(ALARMSEARCH_SIM_EXE), argv.removeFirst();
+            else if (argv.first().startsWith("ALARMSEARCH_PLUGIN="_L1))
+                program = u"/usr/bin/env"_s, argv.insert(1, QStringLiteral(ALARMSEARCH_CLI_EXE));
+            QTest::newRow(name) << program << argv << input << exitCode << output;
         };
+        const auto plugin = [&row](const char* name, const char* file, const char* why) {
+            row(name, u"--plugin %1 query"_s.arg(QLatin1String(file)), 1,
+                u"alarmsearch: cannot load plug-in %1: %2"_s.arg(QLatin1String(file),
+                                                                 QLatin1String(why)));
+        };
+        plugin("missing plug-in file", "/nonexistent/libX.so", "no such file");
+        plugin("no Qt plug-in", FIXTURE_PlainLibrary, "not a Qt plug-in");
+        plugin("other interface", FIXTURE_OtherIidPlugin,
+               "interface identifier \"com.example.SomeOtherInterface\"");
+        plugin("no PluginID", FIXTURE_NoPluginIdPlugin, "no \"PluginID\"");
+        plugin("not an IPluginObjectBase", FIXTURE_PlainObjectPlugin,
+               "instance of PlainObjectPlugin is no IPluginObjectBase");
+        row("plug-in of the environment", u"ALARMSEARCH_PLUGIN=/nonexistent/libY.so query"_s, 1,
+            u"alarmsearch: cannot load plug-in /nonexistent/libY.so: no such file"_s);
         const QString memory = u"--memory --seed-count 20 "_s;
         row("version", u"--version"_s, 0, u"alarmsearch 1.0.0\n"_s);
         row("bad option", u"query --bogus"_s, 2, u"alarmsearch: Unknown option 'bogus'"_s);
@@ -307,8 +326,6 @@ private slots:
             QByteArray(AlarmSearchLimits::MaxRequestLineBytes + 1, ' ') + '\n');
         row("unknown batch method", memory + u"batch"_s, 2,
             u"alarmsearch: line 1: \"method\" must be"_s, "{\"method\":\"ProcessAlarm\"}\n");
-        row("missing plug-in file", u"--plugin /nonexistent/libX.so query"_s, 1,
-            u"alarmsearch: cannot load plug-in /nonexistent/libX.so: no such file"_s);
         row("unreachable server", u"query --server 127.0.0.1:%1"_s.arg(closedPort), 1,
             u"alarmsearch: cannot reach the alarm server"_s);
         row("update without state", memory + u"update A0000001"_s, 2,
@@ -344,6 +361,9 @@ private slots:
         const QString text = QString::fromUtf8(exitCode == 0 ? done.out : done.err);
         QCOMPARE(text.count(u'\n'), 1);
         QVERIFY2(text.startsWith(output), qPrintable(text));
+        if (output.contains("cannot load plug-in"_L1))
+            QVERIFY(
+                text.endsWith("; name the plug-in file with --plugin or ALARMSEARCH_PLUGIN\n"_L1));
     }
 
     // The command-line client end to end on one database of more alarms than a search returns.
