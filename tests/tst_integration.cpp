@@ -341,6 +341,8 @@ private slots:
             u"alarmsearch: unknown time zone \"Mars/Base\""_s);
         row("demo with a database", u"demo --db x.db"_s, 2,
             u"alarmsearch: demo runs its own in-memory server"_s);
+        row("serve off loopback", u"serve --memory --listen 0.0.0.0:0"_s, 1,
+            u"alarmsearch: 0.0.0.0 is not a loopback address: give a users file (--users)"_s);
         row("simulator version", u"sim --version"_s, 0, u"alarmsearch-sim 1.0.0\n"_s);
         row("simulator option", u"sim --bogus"_s, 2,
             u"alarmsearch-sim: Unknown option 'bogus'.; see"_s);
