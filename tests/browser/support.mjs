@@ -21,31 +21,19 @@ export const scratch = () => mkdtempSync(join(tmpdir(), 'console-test-'));
 export function startServe({ port = 0, users = null } = {}) {
   const args = ['serve', '--memory', '--seed-count', '200', '--listen', `127.0.0.1:${port}`];
   if (users) args.push('--users', users);
-  const child = spawn(alarmsearch, args, { stdio: ['ignore', 'pipe', 'pipe'] });
-  let log = '';
-  child.stderr.on('data', (chunk) => { log += chunk; });
+  const child = spawn(alarmsearch, args, { stdio: ['ignore', 'pipe', 'inherit'] });
+  const stopped = new Promise((done) => child.on('exit', done));
   return new Promise((resolve, reject) => {
+    const timer = setTimeout(() => reject(new Error('serve printed no URL within 20 s')), 20000);
+    stopped.then((code) => reject(new Error(`serve did not start: exit code ${code}`)));
     let out = '';
-    const failed = (why) => reject(new Error(`serve did not start: ${why}\n${log}`));
-    const timer = setTimeout(() => failed('no URL within 20 s'), 20000);
-    child.on('exit', (code) => { clearTimeout(timer); failed(`exit code ${code}`); });
     child.stdout.on('data', (chunk) => {
-      out += chunk;
-      const found = /listening on (http:\/\/\S+)/.exec(out);
+      const found = /listening on (http:\/\/\S+)/.exec(out += chunk);
       if (!found) return;
       clearTimeout(timer);
-      child.removeAllListeners('exit');
       const url = new URL(found[1]);
-      resolve({
-        url: url.origin,
-        port: Number(url.port),
-        log: () => log,
-        stop: () => new Promise((done) => {
-          if (child.exitCode !== null) return done(child.exitCode);
-          child.on('exit', (code) => done(code));
-          child.kill('SIGTERM');
-        }),
-      });
+      resolve({ url: url.origin, port: Number(url.port),
+                stop: () => { child.kill('SIGTERM'); return stopped; } });
     });
   });
 }
