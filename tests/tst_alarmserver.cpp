@@ -214,12 +214,6 @@ private slots:
                    return a["ServerTime"] >= m_all.at(300)["ServerTime"] &&
                           a["ServerTime"] <= m_all.at(100)["ServerTime"];
                });
-        QTest::newRow("open start")
-            << ""
-            << ""
-            << "2026-11-05T00:00:00" << AlarmPredicate([](const AlarmFields& a) {
-                   return a["ServerTime"] <= "2026-11-05T00:00:00Z";
-               });
         QTest::newRow("events, state and time together")
             << events(u"<Event>CamEvent</Event>"_s) +
                    "<AlarmStateList><State>Handled</State></AlarmStateList>"
