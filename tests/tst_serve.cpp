@@ -16,9 +16,11 @@
 #include <QTimer>
 #include <QWebSocket>
 
+using namespace Qt::StringLiterals;
+
 namespace {
 
-const QString kAliceToken = QStringLiteral("alice-token-0123456789");
+const QString kAliceToken = u"alice-token-0123456789"_s;
 // Generous, for sanitizer builds on a busy machine.
 constexpr int kWaitMs = 30000;
 
@@ -36,25 +38,19 @@ public:
     explicit Server(QStringList arguments)
     {
         m_process.setProgram(QStringLiteral(ALARMSEARCH_CLI_EXE));
-        if (!arguments.contains(QStringLiteral("--server")))
-            arguments << QStringLiteral("--memory") << QStringLiteral("--seed-count")
-                      << QStringLiteral("50");
-        m_process.setArguments(QStringList{QStringLiteral("serve"), QStringLiteral("--listen"),
-                                           QStringLiteral("127.0.0.1:0")} +
+        if (!arguments.contains(u"--server"_s))
+            arguments << u"--memory"_s << u"--seed-count"_s << u"50"_s;
+        m_process.setArguments(QStringList{u"serve"_s, u"--listen"_s, u"127.0.0.1:0"_s} +
                                arguments);
         m_process.setProcessChannelMode(QProcess::ForwardedErrorChannel);
         m_process.start();
         while (!m_process.canReadLine() && m_process.waitForReadyRead(60000)) {
         }
         const QString line = QString::fromUtf8(m_process.readLine()).trimmed();
-        if (line.startsWith(QLatin1String("listening on ")))
+        if (line.startsWith("listening on "_L1))
             url = QUrl(line.mid(13));
     }
-    ~Server()
-    {
-        m_process.terminate();
-        m_process.waitForFinished(60000);
-    }
+    ~Server() { stop(); }
     int stop()
     {
         m_process.terminate();
@@ -96,14 +92,13 @@ public:
     Events(const QUrl& base, const QString& token, const QString& origin = QString())
     {
         QUrl url = base;
-        url.setScheme(QStringLiteral("ws"));
+        url.setScheme(u"ws"_s);
         url.setPath(ApiRoutes::kEventsPath);
         QNetworkRequest request(url);
         if (!origin.isEmpty())
             request.setRawHeader("Origin", origin.toUtf8());
         connect(&socket, &QWebSocket::connected, this, [this, token] {
-            socket.sendTextMessage(
-                QStringLiteral("{\"type\":\"hello\",\"token\":\"%1\"}").arg(token));
+            socket.sendTextMessage(u"{\"type\":\"hello\",\"token\":\"%1\"}"_s.arg(token));
         });
         connect(&socket, &QWebSocket::textMessageReceived, this, [this](const QString& text) {
             messages.append(QJsonDocument::fromJson(text.toUtf8()).object());
@@ -113,6 +108,23 @@ public:
     QWebSocket socket;
     QList<QJsonObject> messages;
 };
+
+// Runs the command-line client to its end: its exit code, standard output and standard error.
+struct Run
+{
+    int exitCode = -1;
+    QByteArray out;
+    QByteArray err;
+};
+Run cli(const QStringList& arguments)
+{
+    QProcess process;
+    process.start(QStringLiteral(ALARMSEARCH_CLI_EXE), arguments);
+    process.closeWriteChannel();
+    if (!process.waitForFinished(60000) || process.exitStatus() != QProcess::NormalExit)
+        return {};
+    return {process.exitCode(), process.readAllStandardOutput(), process.readAllStandardError()};
+}
 
 QByteArray json(const QJsonObject& object)
 {
@@ -140,51 +152,32 @@ private slots:
         QTest::addColumn<QByteArray>("body");
         QTest::addColumn<int>("status");
         QTest::addColumn<QString>("field"); // of a 400, or a key the answer has
-
-        const QString search = QStringLiteral("/api/v1/alarms/search");
-        QTest::newRow("me") << QByteArray("GET") << "/api/v1/me" << QByteArray() << 200 << "user";
-        QTest::newRow("search") << QByteArray("POST") << search
-                                << QByteArray(R"({"states":["handled"],"from":"2000-01-01"})")
-                                << 200 << "alarms";
-        QTest::newRow("unhandled")
-            << QByteArray("POST") << "/api/v1/alarms/unhandled"
-            << QByteArray(R"({"eventGroups":["camera","system"]})") << 200 << "alarms";
-        QTest::newRow("history") << QByteArray("GET") << "/api/v1/alarms/A0000001/history"
-                                 << QByteArray() << 200 << "entries";
-        QTest::newRow("history export")
-            << QByteArray("GET") << "/api/v1/alarms/A0000001/history/export" << QByteArray() << 200
-            << "entries";
-        QTest::newRow("mute") << QByteArray("POST") << "/api/v1/alarms/mute"
-                              << QByteArray(R"({"ids":["A0000002"],"seconds":60})") << 202
-                              << "sent";
-        QTest::newRow("unmute") << QByteArray("POST") << "/api/v1/alarms/unmute"
-                                << QByteArray(R"({"ids":["A0000002"]})") << 202 << "sent";
-        QTest::newRow("events without upgrade")
-            << QByteArray("GET") << ApiRoutes::kEventsPath << QByteArray() << 426 << "error";
-        QTest::newRow("unknown field")
-            << QByteArray("POST") << search << QByteArray(R"({"colour":"red"})") << 400 << "colour";
-        QTest::newRow("wrong type") << QByteArray("POST") << search
-                                    << QByteArray(R"({"states":"Handled"})") << 400 << "states";
-        QTest::newRow("bad item") << QByteArray("POST") << search
-                                  << QByteArray(R"({"events":["CamEvent:Motion",":x"]})") << 400
-                                  << "events[1]";
-        QTest::newRow("bad time") << QByteArray("POST") << search
-                                  << QByteArray(R"({"to":"yesterday"})") << 400 << "to";
-        QTest::newRow("states on unhandled")
-            << QByteArray("POST") << "/api/v1/alarms/unhandled"
-            << QByteArray(R"({"states":["Handled"]})") << 400 << "states";
-        QTest::newRow("not JSON") << QByteArray("POST") << search << QByteArray("{") << 400
-                                  << "body";
-        QTest::newRow("missing ids") << QByteArray("POST") << "/api/v1/alarms/update"
-                                     << QByteArray(R"({"state":"Handled"})") << 400 << "ids";
-        QTest::newRow("bad seconds")
-            << QByteArray("POST") << "/api/v1/alarms/mute"
-            << QByteArray(R"({"ids":["A1"],"seconds":1.5})") << 400 << "seconds";
-        QTest::newRow("too large")
-            << QByteArray("POST") << search << QByteArray(70 * 1024, ' ') << 413 << "body";
-        QTest::newRow("unknown route")
-            << QByteArray("GET") << "/api/v1/nothing" << QByteArray() << 404 << "path";
-        QTest::newRow("wrong verb") << QByteArray("GET") << search << QByteArray() << 404 << "path";
+        // "VERB /path", and the path's end after /api/v1/alarms/ where it has no slash. The console
+        // test uses the other routes.
+        const auto row = [](const char* name, const char* route, const char* body, int status,
+                            const char* field) {
+            QString path = QString::fromLatin1(route).section(u' ', 1);
+            if (!path.startsWith(u'/'))
+                path.prepend(u"/api/v1/alarms/"_s);
+            QTest::newRow(name) << QByteArray(route).split(' ').first() << path << QByteArray(body)
+                                << status << QString::fromLatin1(field);
+        };
+        row("history export", "GET /api/v1/alarms/A0000001/history/export", "", 200, "entries");
+        row("mute", "POST mute", R"({"ids":["A0000002"],"seconds":60})", 202, "sent");
+        row("unmute", "POST unmute", R"({"ids":["A0000002"]})", 202, "sent");
+        row("events without upgrade", "GET /api/v1/events", "", 426, "error");
+        row("unknown field", "POST search", R"({"colour":"red"})", 400, "colour");
+        row("wrong type", "POST search", R"({"states":"Handled"})", 400, "states");
+        row("bad item", "POST search", R"({"events":["CamEvent:Motion",":x"]})", 400, "events[1]");
+        row("bad time", "POST search", R"({"to":"yesterday"})", 400, "to");
+        row("states on unhandled", "POST unhandled", R"({"states":["Handled"]})", 400, "states");
+        row("not JSON", "POST search", "{", 400, "body");
+        row("missing ids", "POST update", R"({"state":"Handled"})", 400, "ids");
+        row("bad seconds", "POST mute", R"({"ids":["A1"],"seconds":1.5})", 400, "seconds");
+        row("unknown route", "GET /api/v1/nothing", "", 404, "path");
+        row("wrong verb", "GET search", "", 404, "path");
+        QTest::newRow("too large") << QByteArray("POST") << u"/api/v1/alarms/search"_s
+                                   << QByteArray(70 * 1024, ' ') << 413 << u"body"_s;
     }
     void routes()
     {
@@ -198,24 +191,24 @@ private slots:
         // Every answer, also one past the routes, keeps a browser from running inline scripts.
         QVERIFY(reply.contentSecurityPolicy.contains("script-src 'self'"));
         if (status == 400 || status == 413)
-            QCOMPARE(reply.body.value(QLatin1String("field")).toString(), field);
+            QCOMPARE(reply.body.value("field"_L1).toString(), field);
         else
             QVERIFY2(reply.body.contains(field), json(reply.body).constData());
     }
 
     void plainJson()
     {
-        const Reply reply = request(m_server->url, "POST", QStringLiteral("/api/v1/alarms/search"),
-                                    R"({"from":"2000-01-01"})");
-        const QJsonArray alarms = reply.body.value(QLatin1String("alarms")).toArray();
+        const Reply reply =
+            request(m_server->url, "POST", u"/api/v1/alarms/search"_s, R"({"from":"2000-01-01"})");
+        const QJsonArray alarms = reply.body.value("alarms"_L1).toArray();
         QCOMPARE(alarms.size(), 50);
-        QCOMPARE(reply.body.value(QLatin1String("truncated")), QJsonValue(false));
-        QCOMPARE(reply.body.value(QLatin1String("next")), QJsonValue(QJsonValue::Null));
+        QCOMPARE(reply.body.value("truncated"_L1), QJsonValue(false));
+        QCOMPARE(reply.body.value("next"_L1), QJsonValue(QJsonValue::Null));
         const QJsonObject alarm = alarms.first().toObject();
-        QVERIFY(alarm.value(QLatin1String("Muted")).isBool());
-        QVERIFY(!alarm.contains(QLatin1String("XML")));
-        QVERIFY(QRegularExpression(QStringLiteral("^\\d{4}-\\d\\d-\\d\\dT\\d\\d:\\d\\d:\\d\\dZ$"))
-                    .match(alarm.value(QLatin1String("ServerTime")).toString())
+        QVERIFY(alarm.value("Muted"_L1).isBool());
+        QVERIFY(!alarm.contains("XML"_L1));
+        QVERIFY(QRegularExpression(u"^\\d{4}-\\d\\d-\\d\\dT\\d\\d:\\d\\d:\\d\\dZ$"_s)
+                    .match(alarm.value("ServerTime"_L1).toString())
                     .hasMatch());
     }
 
@@ -223,16 +216,15 @@ private slots:
     void openApiMatchesRoutes()
     {
         const Reply reply = request(m_server->url, "GET", ApiRoutes::kOpenApiPath);
-        QCOMPARE(reply.body.value(QLatin1String("openapi")).toString().left(2),
-                 QStringLiteral("3."));
+        QCOMPARE(reply.body.value("openapi"_L1).toString().left(2), u"3."_s);
         QSet<QString> documented;
-        const QJsonObject paths = reply.body.value(QLatin1String("paths")).toObject();
+        const QJsonObject paths = reply.body.value("paths"_L1).toObject();
         for (auto path = paths.begin(); path != paths.end(); ++path) {
             const QJsonObject operations = path.value().toObject();
             for (auto op = operations.begin(); op != operations.end(); ++op) {
                 documented.insert(op.key() + QLatin1Char(' ') + path.key());
                 QString concrete = path.key();
-                concrete.replace(QLatin1String("{alarmId}"), QLatin1String("A0000003"));
+                concrete.replace("{alarmId}"_L1, "A0000003"_L1);
                 const int status =
                     request(m_server->url, op.key().toUpper().toLatin1(), concrete, "{}").status;
                 QVERIFY2(status != 404 && status != 0, qPrintable(path.key()));
@@ -244,40 +236,9 @@ private slots:
         QCOMPARE(documented, routed);
     }
 
-    // An update reaches every subscriber, and a browser from elsewhere is refused.
-    void eventsReachEverySubscriber()
-    {
-        Events first(m_server->url, QString());
-        Events second(m_server->url, QString());
-        Events stranger(m_server->url, QString(), QStringLiteral("http://evil.example"));
-        QTRY_COMPARE_WITH_TIMEOUT(first.messages.size(), 1, kWaitMs);
-        QTRY_COMPARE_WITH_TIMEOUT(second.messages.size(), 1, kWaitMs);
-        QTRY_COMPARE_WITH_TIMEOUT(int(stranger.socket.closeCode()), 4403, kWaitMs);
-        QCOMPARE(first.messages.first().value(QLatin1String("type")).toString(),
-                 QStringLiteral("subscribed"));
-
-        const Reply update = request(m_server->url, "POST", QStringLiteral("/api/v1/alarms/update"),
-                                     R"({"ids":["A0000004","A9999999"],"state":"Processing"})");
-        QCOMPARE(update.status, 200);
-        const QJsonArray results{
-            QJsonObject{
-                {"alarmId", "A0000004"}, {"alarmStatus", "Processing"}, {"updateResult", 0}},
-            QJsonObject{
-                {"alarmId", "A9999999"}, {"alarmStatus", "Processing"}, {"updateResult", 1}}};
-        QCOMPARE(update.body.value(QLatin1String("results")).toArray(), results);
-        for (Events* events : {&first, &second}) {
-            QTRY_COMPARE_WITH_TIMEOUT(events->messages.size(), 2, kWaitMs);
-            const QJsonObject event = events->messages.last();
-            QCOMPARE(event.value(QLatin1String("type")).toString(), QStringLiteral("event"));
-            QCOMPARE(event.value(QLatin1String("data"))
-                         .toObject()
-                         .value(QLatin1String("alarmUpdatedResults"))
-                         .toArray(),
-                     results);
-        }
-    }
-
-    // With a users file, tokens name the operators, and the history shows who changed what.
+    // With a users file, tokens name the operators (the browser test sees the name in a history);
+    // without a known token, nothing but the API description is served; a browser from elsewhere
+    // is refused.
     void tokensNameOperators()
     {
         QTemporaryFile users;
@@ -285,43 +246,19 @@ private slots:
         users.write(
             json({{"users", QJsonArray{QJsonObject{{"name", "alice"}, {"token", kAliceToken}}}}}));
         users.close();
-        Server server({QStringLiteral("--users"), users.fileName()});
+        Server server({u"--users"_s, users.fileName()});
         QVERIFY(server.url.isValid());
-        QCOMPARE(request(server.url, "GET", QStringLiteral("/api/v1/me")).status, 401);
-        QCOMPARE(request(server.url, "GET", QStringLiteral("/api/v1/me"), {},
-                         QStringLiteral("wrong-token-0123456"))
-                     .status,
+        QCOMPARE(request(server.url, "GET", u"/api/v1/me"_s).status, 401);
+        QCOMPARE(request(server.url, "GET", u"/api/v1/me"_s, {}, u"wrong-token-0123456"_s).status,
                  401);
         QCOMPARE(request(server.url, "GET", ApiRoutes::kOpenApiPath).status, 200);
-        QCOMPARE(request(server.url, "POST", QStringLiteral("/api/v1/alarms/update"),
-                         R"({"ids":["A0000005"],"state":"Handled","note":"seen"})", kAliceToken)
-                     .status,
-                 200);
-        const QJsonArray entries =
-            request(server.url, "GET", QStringLiteral("/api/v1/alarms/A0000005/history"), {},
-                    kAliceToken)
-                .body.value(QLatin1String("entries"))
-                .toArray();
-        QCOMPARE(entries.last().toObject().value(QLatin1String("User")).toString(),
-                 QStringLiteral("alice"));
-
-        Events refused(server.url, QStringLiteral("wrong-token-0123456"));
+        Events refused(server.url, u"wrong-token-0123456"_s);
         Events accepted(server.url, kAliceToken);
+        Events stranger(server.url, kAliceToken, u"http://evil.example"_s);
         QTRY_COMPARE_WITH_TIMEOUT(int(refused.socket.closeCode()), 4401, kWaitMs);
+        QTRY_COMPARE_WITH_TIMEOUT(int(stranger.socket.closeCode()), 4403, kWaitMs);
         QTRY_COMPARE_WITH_TIMEOUT(accepted.messages.size(), 1, kWaitMs);
-        QCOMPARE(accepted.messages.first().value(QLatin1String("user")).toString(),
-                 QStringLiteral("alice"));
-    }
-
-    void nonLoopbackNeedsUsers()
-    {
-        QProcess serve;
-        serve.start(QStringLiteral(ALARMSEARCH_CLI_EXE),
-                    {QStringLiteral("serve"), QStringLiteral("--memory"),
-                     QStringLiteral("--listen"), QStringLiteral("0.0.0.0:0")});
-        QVERIFY(serve.waitForFinished(60000));
-        QCOMPARE(serve.exitCode(), 1);
-        QVERIFY(serve.readAllStandardError().contains("loopback"));
+        QCOMPARE(accepted.messages.first().value("user"_L1).toString(), u"alice"_s);
     }
 
     // The alarm server failing: the plug-in's result code comes back with 502.
@@ -329,18 +266,16 @@ private slots:
     {
         QProcess simulator;
         simulator.start(QStringLiteral(ALARMSEARCH_SIM_EXE),
-                        {QStringLiteral("--memory"), QStringLiteral("--seed-count"),
-                         QStringLiteral("10"), QStringLiteral("--port"), QStringLiteral("0")});
+                        {u"--memory"_s, u"--seed-count"_s, u"10"_s, u"--port"_s, u"0"_s});
         QVERIFY(simulator.waitForReadyRead(60000));
         const QString address = QString::fromUtf8(simulator.readLine()).trimmed().mid(13);
-        Server server({QStringLiteral("--server"), address});
+        Server server({u"--server"_s, address});
         QVERIFY(server.url.isValid());
         simulator.kill();
         simulator.waitForFinished();
-        const Reply reply =
-            request(server.url, "GET", QStringLiteral("/api/v1/alarms/A0000001/history"));
+        const Reply reply = request(server.url, "GET", u"/api/v1/alarms/A0000001/history"_s);
         QCOMPARE(reply.status, 502);
-        QCOMPARE(reply.body.value(QLatin1String("resultCode")).toString(), QStringLiteral("-1"));
+        QCOMPARE(reply.body.value("resultCode"_L1).toString(), u"-1"_s);
     }
 
     // `events --host` in one process sees the change `update --host` makes in another.
@@ -349,70 +284,41 @@ private slots:
         const QString host = m_server->url.toString();
         QProcess events;
         events.start(QStringLiteral(ALARMSEARCH_CLI_EXE),
-                     {QStringLiteral("events"), QStringLiteral("--host"), host,
-                      QStringLiteral("--count"), QStringLiteral("1")});
+                     {u"events"_s, u"--host"_s, host, u"--count"_s, u"1"_s});
         events.setReadChannel(QProcess::StandardError);
         QVERIFY(events.waitForReadyRead(60000)); // its note that it waits: it is subscribed
         events.setReadChannel(QProcess::StandardOutput);
-        QProcess update;
-        update.start(QStringLiteral(ALARMSEARCH_CLI_EXE),
-                     {QStringLiteral("update"), QStringLiteral("A0000006"),
-                      QStringLiteral("--state"), QStringLiteral("handled"),
-                      QStringLiteral("--note"), QStringLiteral("from the CLI"),
-                      QStringLiteral("--host"), host});
-        QVERIFY(update.waitForFinished(60000));
-        QCOMPARE(update.exitCode(), 0);
-        const QList<QByteArray> printed = update.readAllStandardOutput().trimmed().split('\n');
-        QCOMPARE(printed.size(), 2); // the event, then the answer
-        QCOMPARE(QJsonDocument::fromJson(printed.last())
-                     .object()
-                     .value(QLatin1String("type"))
-                     .toString(),
-                 QStringLiteral("answer"));
+        const auto [updated, printed, ignored] =
+            cli({u"update"_s, u"A0000006"_s, u"--state"_s, u"handled"_s, u"--note"_s,
+                 u"from the CLI"_s, u"--host"_s, host});
+        QCOMPARE(updated, 0);
+        const QList<QByteArray> lines = printed.trimmed().split('\n');
+        QCOMPARE(lines.size(), 2); // the event, then the answer
+        QCOMPARE(QJsonDocument::fromJson(lines.last()).object().value("type"_L1).toString(),
+                 u"answer"_s);
 
         QVERIFY(events.waitForFinished(60000));
         const QJsonObject event = QJsonDocument::fromJson(events.readAllStandardOutput()).object();
-        QCOMPARE(event.value(QLatin1String("data"))
-                     .toObject()
-                     .value(QLatin1String("alarmUpdatedResults"))
-                     .toArray(),
+        QCOMPARE(event.value("data"_L1).toObject().value("alarmUpdatedResults"_L1).toArray(),
                  (QJsonArray{QJsonObject{
                      {"alarmId", "A0000006"}, {"alarmStatus", "Handled"}, {"updateResult", 0}}}));
 
-        QProcess history;
-        history.start(QStringLiteral(ALARMSEARCH_CLI_EXE),
-                      {QStringLiteral("history"), QStringLiteral("A0000006"),
-                       QStringLiteral("--host"), host});
-        QVERIFY(history.waitForFinished(60000));
-        const QJsonArray entries = QJsonDocument::fromJson(history.readAllStandardOutput())
-                                       .object()
-                                       .value(QLatin1String("result"))
-                                       .toArray();
-        QCOMPARE(entries.last().toObject().value(QLatin1String("User")).toString(),
-                 QStringLiteral("local"));
-        QCOMPARE(entries.last().toObject().value(QLatin1String("Note")).toString(),
-                 QStringLiteral("from the CLI"));
-    }
+        const QJsonObject last =
+            QJsonDocument::fromJson(cli({u"history"_s, u"A0000006"_s, u"--host"_s, host}).out)
+                .object()
+                .value("result"_L1)
+                .toArray()
+                .last()
+                .toObject();
+        QCOMPARE(last.value("User"_L1).toString() + u'|' + last.value("Note"_L1).toString(),
+                 u"local|from the CLI"_s);
 
-    // An unknown alarm is named, and the command fails, as without --host.
-    void cliNamesUnknownAlarms_data()
-    {
-        QTest::addColumn<QStringList>("arguments");
-        QTest::newRow("history") << QStringList{QStringLiteral("history"), QStringLiteral("NOPE")};
-        QTest::newRow("mute") << QStringList{QStringLiteral("mute"), QStringLiteral("NOPE"),
-                                             QStringLiteral("A0000001")};
-    }
-
-    void cliNamesUnknownAlarms()
-    {
-        QFETCH(QStringList, arguments);
-        QProcess cli;
-        cli.start(QStringLiteral(ALARMSEARCH_CLI_EXE),
-                  arguments + QStringList{QStringLiteral("--host"), m_server->url.toString()});
-        QVERIFY(cli.waitForFinished(60000));
-        QCOMPARE(cli.exitStatus(), QProcess::NormalExit);
-        QCOMPARE(cli.exitCode(), 1);
-        QVERIFY(cli.readAllStandardError().contains("unknown alarm: NOPE"));
+        // An unknown alarm is named, and the command fails, as without --host (it crashed).
+        for (const QString& command : {u"history NOPE"_s, u"mute NOPE A0000001"_s}) {
+            const Run unknown = cli(command.split(u' ') + QStringList{u"--host"_s, host});
+            QCOMPARE(unknown.exitCode, 1);
+            QVERIFY(unknown.err.contains("unknown alarm: NOPE"));
+        }
     }
 
 private:

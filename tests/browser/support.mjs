@@ -1,67 +1,42 @@
 // What the console's browser tests share: a real `alarmsearch serve` on a loopback port and
 // Debian's Chromium driven by playwright-core.
 
-import { spawn, execFile } from 'node:child_process';
-import { mkdtempSync, mkdirSync, rmSync, writeFileSync } from 'node:fs';
+import { spawn } from 'node:child_process';
+import { mkdtempSync, mkdirSync, rmSync } from 'node:fs';
 import { tmpdir } from 'node:os';
 import { join } from 'node:path';
-import { promisify } from 'node:util';
 
 export const alarmsearch = process.env.ALARMSEARCH_BIN;
 if (!alarmsearch) throw new Error('set ALARMSEARCH_BIN to the alarmsearch executable (CTest does)');
 export const screenshots = process.env.ALARMSEARCH_SCREENSHOTS || join(tmpdir(), 'console-shots');
 mkdirSync(screenshots, { recursive: true });
 
-let chromium;
-try {
-  ({ chromium } = await import('playwright-core'));
-} catch {
+const { chromium } = await import('playwright-core').catch(() => {
   throw new Error('playwright-core is missing: run scripts/setup.sh (npm ci) first');
-}
+});
 
 export const scratch = () => mkdtempSync(join(tmpdir(), 'console-test-'));
-
-export function usersFile(dir, users) {
-  const file = join(dir, 'users.json');
-  writeFileSync(file, JSON.stringify({ users }));
-  return file;
-}
 
 // Starts serve with an in-memory simulator; resolves once it prints the URL it listens on.
 export function startServe({ port = 0, users = null } = {}) {
   const args = ['serve', '--memory', '--seed-count', '200', '--listen', `127.0.0.1:${port}`];
   if (users) args.push('--users', users);
-  const child = spawn(alarmsearch, args, { stdio: ['ignore', 'pipe', 'pipe'] });
-  let log = '';
-  child.stderr.on('data', (chunk) => { log += chunk; });
+  const child = spawn(alarmsearch, args, { stdio: ['ignore', 'pipe', 'inherit'] });
+  const stopped = new Promise((done) => child.on('exit', done));
   return new Promise((resolve, reject) => {
+    const timer = setTimeout(() => reject(new Error('serve printed no URL within 20 s')), 20000);
+    stopped.then((code) => reject(new Error(`serve did not start: exit code ${code}`)));
     let out = '';
-    const failed = (why) => reject(new Error(`serve did not start: ${why}\n${log}`));
-    const timer = setTimeout(() => failed('no URL within 20 s'), 20000);
-    child.on('exit', (code) => { clearTimeout(timer); failed(`exit code ${code}`); });
     child.stdout.on('data', (chunk) => {
-      out += chunk;
-      const found = /listening on (http:\/\/\S+)/.exec(out);
+      const found = /listening on (http:\/\/\S+)/.exec(out += chunk);
       if (!found) return;
       clearTimeout(timer);
-      child.removeAllListeners('exit');
       const url = new URL(found[1]);
-      resolve({
-        url: url.origin,
-        port: Number(url.port),
-        log: () => log,
-        stop: () => new Promise((done) => {
-          if (child.exitCode !== null) return done(child.exitCode);
-          child.on('exit', (code) => done(code));
-          child.kill('SIGTERM');
-        }),
-      });
+      resolve({ url: url.origin, port: Number(url.port),
+                stop: () => { child.kill('SIGTERM'); return stopped; } });
     });
   });
 }
-
-export const runCli = (args, env = {}) =>
-  promisify(execFile)(alarmsearch, args, { env: { ...process.env, ...env }, timeout: 20000 });
 
 // A fresh profile for each browser, removed when it closes.
 export async function launchBrowser() {
@@ -74,13 +49,8 @@ export async function launchBrowser() {
     args: ['--headless', '--no-sandbox', '--disable-gpu', '--disable-quic', '--no-first-run',
            '--disable-background-networking', '--disable-component-update', '--disable-sync'],
   });
-  context.on('close', () => {
-    try {
-      rmSync(profile, { recursive: true, force: true, maxRetries: 5 });
-    } catch {
-      // Chromium may still be writing it; a profile left in the temporary folder does no harm.
-    }
-  });
+  // Chromium may still be writing it; a profile left in the temporary folder does no harm.
+  context.on('close', () => { try { rmSync(profile, { recursive: true, force: true }); } catch {} });
   return context;
 }
 
@@ -100,8 +70,6 @@ export async function signIn(page, url, token) {
   await page.getByLabel('Access token').press('Enter');
   await page.locator('#live-status.on').waitFor();
 }
-
-export const row = (page, id) => page.locator(`#alarms tbody tr[data-id="${id}"]`);
 
 export async function rowIds(page) {
   return page.locator('#alarms tbody tr').evaluateAll((rows) => rows.map((r) => r.dataset.id));
