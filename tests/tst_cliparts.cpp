@@ -42,7 +42,7 @@ public:
     bool search(const QVariantMap& args, QVariantList* page, QString*)
     {
         ++searches;
-        const QString end = args.value(ARG_END_TIME).toString();
+        const QString end = ignoresWindow ? QString() : args.value(ARG_END_TIME).toString();
         page->clear();
         for (const QVariantMap& alarm : std::as_const(m_alarms)) {
             const QString time = alarm.value(u"ServerTime"_s).toString().chopped(1); // drop "Z"
@@ -52,9 +52,13 @@ public:
                 break;
             page->append(alarm);
         }
+        if (oldestFirst)
+            std::reverse(page->begin(), page->end());
         return true;
     }
     int searches = 0;
+    bool oldestFirst = false; // misbehaving servers
+    bool ignoresWindow = false;
 
 private:
     QList<QVariantMap> m_alarms;
@@ -255,6 +259,35 @@ private slots:
         QCOMPARE(ids.size(), found.size());
         QCOMPARE(store.searches, expectedSearches);
         QCOMPARE(pager.warning().contains(u"may be missing"_s), oneSecond);
+    }
+
+    void pagerRefusesPagesOutOfOrder_data()
+    {
+        QTest::addColumn<bool>("oldestFirst");
+        QTest::addColumn<bool>("ignoresWindow");
+        QTest::newRow("oldest first") << true << false;
+        QTest::newRow("ignores the window") << false << true;
+    }
+
+    // Such a server used to keep the walk going forever.
+    void pagerRefusesPagesOutOfOrder()
+    {
+        QFETCH(bool, oldestFirst);
+        QFETCH(bool, ignoresWindow);
+        QList<QVariantMap> alarms;
+        for (int i = 0; i < 12000; ++i)
+            alarms.append(alarm(i + 1, kNow.addSecs(-i)));
+        FakeAlarmStore store(alarms);
+        store.oldestFirst = oldestFirst;
+        store.ignoresWindow = ignoresWindow;
+        AlarmPager pager([&store](const QVariantMap& args, QVariantList* page, QString* error) {
+            return store.search(args, page, error);
+        });
+        QString error;
+        QVERIFY(!pager.fetchAll(
+            {}, [](const QVariantList&, QString*) { return true; }, &error));
+        QCOMPARE(error, u"the server's alarms are not newest first within the searched time "
+                        "range; stopped after %1 alarms"_s.arg(oldestFirst ? 0 : 5000));
     }
 
     // Muted and ServerTime are typed by the serve test; these no other test reads.

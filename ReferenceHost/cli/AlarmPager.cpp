@@ -36,7 +36,7 @@ bool AlarmPager::fetchAll(const QVariantMap& args, const PageSink& sink, QString
         const QDateTime newestTime = page.isEmpty() ? QDateTime() : serverTimeOf(page.constFirst());
         const QDateTime oldestTime = page.isEmpty() ? QDateTime() : serverTimeOf(page.constLast());
         if ((newestTime.isValid() && newestTime < oldestTime) ||
-            (windowEnd.isValid() && oldestTime > windowEnd)) {
+            (windowEnd.isValid() && newestTime > windowEnd)) {
             *errorMessage = QStringLiteral("the server's alarms are not newest first within the "
                                            "searched time range; stopped after %1 alarms")
                                 .arg(m_alarmCount);
