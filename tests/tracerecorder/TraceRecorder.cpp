@@ -14,7 +14,7 @@
 
 namespace {
 
-constexpr int32_t DefaultModuleId = 42;
+constexpr int32_t ModuleId = 42;
 
 // Recorder state; a deque keeps the entries' text in place while new entries are added.
 struct Recorder
@@ -24,7 +24,6 @@ struct Recorder
     std::set<int64_t> refused;
     TraceGlobalObject object{};
     int contextTag = 0;
-    int32_t moduleId = DefaultModuleId;
 };
 
 Recorder& recorder()
@@ -58,7 +57,7 @@ void registerModule(void* context, int32_t kind, const char* moduleName, int32_t
     record(context,
            "register " + std::to_string(kind) + ' ' + (moduleName ? moduleName : "(null)"));
     if (moduleId)
-        *moduleId = recorder().moduleId;
+        *moduleId = ModuleId;
 }
 
 int32_t checkLevel(void* context, int64_t levelCode, int64_t reserved, const char* file,
@@ -89,12 +88,10 @@ TRACERECORDER_EXPORT int32_t LogTrace_GetGlobalObject(int32_t /*reserved*/,
 {
     Recorder& r = recorder();
     r.object = TraceGlobalObject{};
-    r.object.context = envFlag("TRACERECORDER_NULL_CONTEXT") ? nullptr : &r.contextTag;
+    r.object.context = &r.contextTag;
     r.object.registerModule = envFlag("TRACERECORDER_NO_REGISTER") ? nullptr : registerModule;
     r.object.checkLevel = checkLevel;
-    r.object.output = envFlag("TRACERECORDER_NO_OUTPUT") ? nullptr : output;
-    if (const char* id = std::getenv("TRACERECORDER_MODULE_ID"))
-        r.moduleId = static_cast<int32_t>(std::strtol(id, nullptr, 0));
+    r.object.output = output;
     *object = &r.object;
     return 0;
 }

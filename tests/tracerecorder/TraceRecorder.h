@@ -8,10 +8,8 @@
 // An entry whose context argument is not the context the library handed out ends in
 // " [context <pointer>]".
 //
-// Read when LogTrace_GetGlobalObject is called: TRACERECORDER_NO_REGISTER=1 and
-// TRACERECORDER_NO_OUTPUT=1 leave the registration or the output entry null,
-// TRACERECORDER_NULL_CONTEXT=1 hands out a null context, TRACERECORDER_MODULE_ID sets the module
-// id that registration gives (default 42).
+// Registration gives the module id 42. TRACERECORDER_NO_REGISTER=1, read when
+// LogTrace_GetGlobalObject is called, leaves the registration entry null.
 //
 // Tests find these functions with dlopen("libZoltLogUtl.dylib", RTLD_NOLOAD) and dlsym.
 

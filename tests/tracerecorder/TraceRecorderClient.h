@@ -36,6 +36,9 @@ public:
             entries << QString::fromUtf8(m_entry(i));
         return entries;
     }
+    // The written lines, and the checks ("<level code> <reserved> <file>:<line>").
+    QStringList lines() const { return entries(QStringLiteral("out ")); }
+    QStringList checks() const { return entries(QStringLiteral("check ")); }
     void reset() const
     {
         if (m_handle)
@@ -48,6 +51,15 @@ public:
     }
 
 private:
+    QStringList entries(const QString& kind) const
+    {
+        QStringList out;
+        for (const QString& entry : journal())
+            if (entry.startsWith(kind))
+                out << entry.mid(kind.size());
+        return out;
+    }
+
     template <typename Fn> Fn resolve(const char* name) const
     {
         auto fn = reinterpret_cast<Fn>(dlsym(m_handle, name));
