@@ -229,29 +229,33 @@ private slots:
         QCOMPARE(AlarmXmlParser::readAlarmListReply(largest)->size(), 1);
     }
 
+    // Refused by the reader; the splitter refuses a document type as a whole and reads the
+    // alarm around a character reference or a noncharacter it was not asked to judge.
     void hostileReplies_data()
     {
         QTest::addColumn<QString>("reply");
+        QTest::addColumn<int>("texts"); // from the splitter
         QTest::newRow("entity bomb")
             << "<!DOCTYPE QryAlarmListRes [<!ENTITY a '" + QString(1000, u'a') + "'><!ENTITY b '" +
                    QStringLiteral("&a;").repeated(1000) + "'>]><QryAlarmListRes><Alarm><N>" +
-                   QStringLiteral("&b;").repeated(1000) + "</N></Alarm></QryAlarmListRes>";
+                   QStringLiteral("&b;").repeated(1000) + "</N></Alarm></QryAlarmListRes>"
+            << 0;
         QTest::newRow("document type only")
-            << "<!DOCTYPE QryAlarmListRes><QryAlarmListRes><Alarm/></QryAlarmListRes>";
+            << "<!DOCTYPE QryAlarmListRes><QryAlarmListRes><Alarm/></QryAlarmListRes>" << 0;
         QTest::newRow("reference to U+0001")
-            << "<QryAlarmListRes><Alarm><N>&#1;</N></Alarm></QryAlarmListRes>";
+            << "<QryAlarmListRes><Alarm><N>&#1;</N></Alarm></QryAlarmListRes>" << 1;
         QTest::newRow("raw U+FFFF") << "<QryAlarmListRes><Alarm><N>" + QString(QChar(0xFFFF)) +
-                                           "</N></Alarm></QryAlarmListRes>";
+                                           "</N></Alarm></QryAlarmListRes>"
+                                    << 1;
     }
 
     void hostileReplies()
     {
         QFETCH(QString, reply);
+        QFETCH(int, texts);
         QCOMPARE(AlarmXmlParser::readAlarmListReply(reply), std::nullopt);
         QVERIFY(!query(reply).ok);
-        QVERIFY(AlarmXmlParser::getAlarmList(reply).size() <= 1);
-        if (reply.startsWith(QLatin1String("<!DOCTYPE")))
-            QCOMPARE(AlarmXmlParser::getAlarmList(reply), QList<QString>());
+        QCOMPARE(AlarmXmlParser::getAlarmList(reply).size(), texts);
     }
 
     // Text full of characters to escape: QDomNode::save escapes in place, in time quadratic in
