@@ -109,35 +109,6 @@ private slots:
         QVERIFY(f.host.answers().isEmpty()); // nothing is answered before a reply arrives
     }
 
-    void methodPairsSendTheSameCommand_data()
-    {
-        QTest::addColumn<QString>("first");
-        QTest::addColumn<QString>("second");
-        QTest::newRow("queries") << "QryUnhandledAlarm"
-                                 << "QryAlarmList";
-        QTest::newRow("history") << "GetAlarmHistory"
-                                 << "GetAlarmHistoryForExport";
-    }
-
-    void methodPairsSendTheSameCommand()
-    {
-        QFETCH(QString, first);
-        QFETCH(QString, second);
-        const QVariantMap args{{ARG_STATE_FILTER, "<AlarmStateList><State>Unhandled</State>"
-                                                  "</AlarmStateList>"},
-                               {ARG_START_TIME, "2026-11-01T00:00:00"},
-                               {ARG_ALARM_ID, "A7"},
-                               {ARG_RELAY_PATH, "relay/1"}};
-        Fixture f;
-        f.request(first, args);
-        f.request(second, args);
-        const QList<FakeTunnelClient::Record> records = f.host.tunnel.records();
-        QCOMPARE(records.size(), 2);
-        QCOMPARE(records.at(0).commandText, records.at(1).commandText);
-        QCOMPARE(records.at(0).relayPath, QStringLiteral("relay/1"));
-        QCOMPARE(records.at(1).relayPath, QStringLiteral("relay/1"));
-    }
-
     void queryAnswers()
     {
         Fixture f;
@@ -227,9 +198,19 @@ private slots:
                                 << composer.composeProcessAlarmMessage(
                                        ids, {{ARG_ALARM_STATUS, "Handled"}}, "checked on site")
                                 << "relay/u";
-        QTest::newRow("history") << METHOD_GET_ALARM_HISTORY
-                                 << QVariantMap{{ARG_ALARM_ID, "A9"}, {ARG_RELAY_PATH, "relay/h"}}
-                                 << composer.composeGetAlarmInfoMessage("A9") << "relay/h";
+        // The methods of each pair send the same command.
+        const QVariantMap query{{ARG_STATE_FILTER, "<AlarmStateList><State>Unhandled</State>"
+                                                   "</AlarmStateList>"},
+                                {ARG_START_TIME, "2026-11-01T00:00:00"},
+                                {ARG_RELAY_PATH, "relay/q"}};
+        for (const QString& method : {METHOD_QUERY_ALARM_LIST, METHOD_QUERY_UNHANDLED_ALARM})
+            QTest::newRow(qPrintable(method))
+                << method << query << composer.composeQueryAlarmListMessage(query) << "relay/q";
+        const QVariantMap history{{ARG_ALARM_ID, "A9"}, {ARG_RELAY_PATH, "relay/h"}};
+        for (const QString& method :
+             {METHOD_GET_ALARM_HISTORY, METHOD_GET_ALARM_HISTORY_FOR_EXPORT})
+            QTest::newRow(qPrintable(method))
+                << method << history << composer.composeGetAlarmInfoMessage("A9") << "relay/h";
         QTest::newRow("mute, ids only")
             << METHOD_MUTE_ALARM << QVariantMap{{ARG_ALARM_ID_LIST, QStringList{"A1"}}}
             << composer.composeMuteAlarmMessage({"A1"}, false, 0) << QString();
