@@ -9,7 +9,6 @@
 
 #include <QtTest>
 
-#include <thread>
 #include <type_traits>
 
 using namespace PluginAlarmSearchCommon;
@@ -298,37 +297,6 @@ private slots:
                                "</Entry></ChangeLogs></Alarm></GetAlarmInfoRes>";
         QCOMPARE(read(Info, {true, "", "0", single, true}).result.toList(),
                  (QVariantList{QVariantMap{{"State", "A"}}}));
-    }
-
-    // The tunnel may call a reply callback more than once, from any thread, even after the
-    // control that sent the request is gone.
-    void repeatedRepliesOnOtherThreadsAfterDestruction()
-    {
-        FakeTunnelClient tunnel;
-        std::atomic<int> calls{0};
-        std::atomic<int> alarms{0};
-        {
-            ORVOSrvTunnelControl control(&tunnel);
-            control.queryAlarm(
-                client, QVariant(),
-                [&](bool ok, bool, const QVariant& result, const QString&, const QString&) {
-                    ++calls;
-                    if (ok)
-                        alarms += result.toList().size();
-                });
-        }
-        const FakeTunnelClient::Record record = tunnel.last();
-        std::vector<std::thread> threads;
-        for (int i = 0; i < 4; ++i) {
-            threads.emplace_back([&] {
-                for (int j = 0; j < 25; ++j)
-                    FakeTunnelClient::deliver(record, {true, "r", "0", threeAlarms, j == 24});
-            });
-        }
-        for (std::thread& t : threads)
-            t.join();
-        QCOMPARE(calls.load(), 100);
-        QCOMPARE(alarms.load(), 300);
     }
 };
 
