@@ -1,8 +1,7 @@
-#include "support/FakeTunnelClient.h"
+#include "support/ReaderRun.h"
 
 #include <AlarmSearchLimits.h>
 #include <AlarmXmlParser.h>
-#include <ORVOSrvTunnelControl.h>
 #include <XmlHelper.h>
 
 #include <QDomDocument>
@@ -42,36 +41,13 @@ void dismantle(QDomDocument& document)
         top = top.removeChild(top.firstChild());
 }
 
-struct QueryOutcome
-{
-    int calls = 0;
-    bool ok = true;
-};
-
-QueryOutcome query(const QString& reply)
-{
-    QueryOutcome outcome;
-    ORVOSrvTunnelControl::queryAlarmCB(
-        true, QString(), QStringLiteral("0"), reply, true,
-        [&outcome](bool ok, bool, const QVariant&, const QString&, const QString&) {
-            ++outcome.calls;
-            outcome.ok = ok;
-        });
-    return outcome;
-}
-
 // Whether the update and history readers both read the reply; they agree on every reply.
 bool othersRead(const QString& reply)
 {
-    bool ok[2] = {};
-    const auto record = [](bool& target) {
-        return [&target](bool readOk, bool, const QVariant&, const QString&) { target = readOk; };
-    };
-    ORVOSrvTunnelControl::processAlarmCB(true, {}, "0", reply, true, record(ok[0]));
-    ORVOSrvTunnelControl::getAlarmInfoCB(true, {}, "0", reply, true, record(ok[1]));
-    if (ok[0] != ok[1])
+    const bool process = readReply(Reader::Process, {true, {}, "0", reply, true}).ok;
+    if (process != readReply(Reader::Info, {true, {}, "0", reply, true}).ok)
         qFatal("the update and history readers disagree");
-    return ok[0];
+    return process;
 }
 
 QString repeated(int count, const QString& pattern)
@@ -116,7 +92,7 @@ private slots:
         QCOMPARE(AlarmXmlParser::getAlarmList(reply).size(), read ? 1 : 0);
         const std::optional<QVariantList> alarms = AlarmXmlParser::readAlarmListReply(reply);
         QCOMPARE(alarms ? alarms->size() : -1, read ? 1 : -1);
-        const QueryOutcome outcome = query(reply);
+        const ReaderOutcome outcome = readAlarmList(reply);
         QCOMPARE(outcome.calls, 1);
         QCOMPARE(outcome.ok, read);
     }
@@ -172,7 +148,7 @@ private slots:
         QFETCH(bool, othersRead);
         const std::optional<QVariantList> read = AlarmXmlParser::readAlarmListReply(reply);
         QCOMPARE(read ? int(read->size()) : -1, alarms);
-        QCOMPARE(query(reply).ok, alarms >= 0);
+        QCOMPARE(readAlarmList(reply).ok, alarms >= 0);
         // The splitter gives a text per alarm or nothing, never an alarm cut short.
         const QList<QString> texts = AlarmXmlParser::getAlarmList(reply);
         QCOMPARE(texts.size(), qMax(alarms, 0));
@@ -216,7 +192,7 @@ private slots:
                               QStringLiteral("</QryAlarmListRes>");
         QCOMPARE(AlarmXmlParser::getAlarmList(reply), QList<QString>());
         QCOMPARE(AlarmXmlParser::readAlarmListReply(reply), std::nullopt);
-        QVERIFY(!query(reply).ok);
+        QVERIFY(!readAlarmList(reply).ok);
 
         // Just within the bound it is read.
         const QString largest = reply.left(25) + reply.right(18) +
@@ -249,7 +225,7 @@ private slots:
         QFETCH(QString, reply);
         QFETCH(int, texts);
         QCOMPARE(AlarmXmlParser::readAlarmListReply(reply), std::nullopt);
-        QVERIFY(!query(reply).ok);
+        QVERIFY(!readAlarmList(reply).ok);
         QCOMPARE(AlarmXmlParser::getAlarmList(reply).size(), texts);
     }
 

@@ -6,8 +6,8 @@
 #include "PluginAlarmSearchSrv_Log.h"
 #include "TraceRecorderClient.h"
 #include "support/FakeHost.h"
+#include "support/ReaderRun.h"
 
-#include <ORVOSrvTunnelControl.h>
 #include <PluginAlarmSearchSrv.h>
 #include <RequestSenderInfo.h>
 
@@ -295,14 +295,7 @@ private slots:
         QFETCH(QString, status);
         QFETCH(QString, reply);
         QFETCH(QStringList, lines);
-        const auto ignoreQuery = [](bool, bool, const QVariant&, const QString&, const QString&) {};
-        const auto ignore = [](bool, bool, const QVariant&, const QString&) {};
-        if (reader == 0)
-            ORVOSrvTunnelControl::queryAlarmCB(ok, "r", status, reply, true, ignoreQuery);
-        else if (reader == 1)
-            ORVOSrvTunnelControl::processAlarmCB(ok, "r", status, reply, true, ignore);
-        else
-            ORVOSrvTunnelControl::getAlarmInfoCB(ok, "r", status, reply, true, ignore);
+        readReply(Reader(reader), {ok, "r", status, reply, true});
         QCOMPARE(m_recorder.lines(), lines);
         for (const QString& check : m_recorder.checks())
             QVERIFY(check.startsWith("10754 0 "));

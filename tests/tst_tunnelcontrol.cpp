@@ -1,7 +1,7 @@
 // The tunnel control: what it hands the tunnel for each operation, and what its readers make of
 // the replies.
 
-#include "support/FakeTunnelClient.h"
+#include "support/ReaderRun.h"
 
 #include <MessageComposer.h>
 #include <ORVOSrvTunnelControl.h>
@@ -20,30 +20,6 @@ static_assert(std::is_polymorphic_v<ORVOSrvTunnelControl> &&
               !std::has_virtual_destructor_v<ORVOSrvTunnelControl>);
 
 namespace {
-
-struct Outcome
-{
-    int calls = 0;
-    bool ok = false;
-    bool isLast = false;
-    QVariant result;
-    QString statusText;
-    QString relayPath;
-};
-
-ORVOSrvTunnelControl::QueryAlarmCompletion recordQuery(Outcome& out)
-{
-    return
-        [&out](bool ok, bool isLast, const QVariant& result, const QString& status,
-               const QString& relay) { out = {out.calls + 1, ok, isLast, result, status, relay}; };
-}
-
-ORVOSrvTunnelControl::ReplyCompletion recordReply(Outcome& out)
-{
-    return [&out](bool ok, bool isLast, const QVariant& result, const QString& relay) {
-        out = {out.calls + 1, ok, isLast, result, QString(), relay};
-    };
-}
 
 // Writes back the arguments it is given, so that a test sees what the control handed it; a
 // value "bad" makes a command it cannot write.
@@ -71,6 +47,7 @@ struct EchoComposer : MessageComposer
 };
 
 enum Operation { Query, Process, Info, Mute };
+using Outcome = ReaderOutcome;
 
 void* const client = reinterpret_cast<void*>(0x1234);
 
@@ -92,22 +69,6 @@ bool run(ORVOSrvTunnelControl& control, Operation operation, const QVariant& arg
         return true;
     }
     return false;
-}
-
-// What a reader makes of one reply.
-Outcome read(Operation reader, const FakeTunnelClient::Reply& r)
-{
-    Outcome out;
-    if (reader == Query)
-        ORVOSrvTunnelControl::queryAlarmCB(r.ok, r.relayPath, r.statusText, r.replyText, r.isLast,
-                                           recordQuery(out));
-    else if (reader == Process)
-        ORVOSrvTunnelControl::processAlarmCB(r.ok, r.relayPath, r.statusText, r.replyText, r.isLast,
-                                             recordReply(out));
-    else
-        ORVOSrvTunnelControl::getAlarmInfoCB(r.ok, r.relayPath, r.statusText, r.replyText, r.isLast,
-                                             recordReply(out));
-    return out;
 }
 
 const QString threeAlarms = QStringLiteral(
@@ -250,7 +211,7 @@ private slots:
         QFETCH(QList<int>, items);
         for (const bool isLast : {false, true}) {
             for (const Operation reader : {Query, Process, Info}) {
-                const Outcome o = read(reader, {ok, "relay/x", status, reply, isLast});
+                const Outcome o = readReply(Reader(reader), {ok, "relay/x", status, reply, isLast});
                 QCOMPARE(o.calls, 1);
                 QCOMPARE(o.ok, !items.isEmpty());
                 QCOMPARE(o.isLast, isLast);
@@ -265,7 +226,7 @@ private slots:
 
     void readerResults()
     {
-        const QVariantList alarms = read(Query, {true, "", "0", threeAlarms, true}).result.toList();
+        const QVariantList alarms = readAlarmList(threeAlarms).result.toList();
         QCOMPARE(alarms.size(), 3);
         QCOMPARE(
             alarms.at(0).toMap(),
@@ -282,20 +243,20 @@ private slots:
         const QString results =
             "<ProcessAlarmRes><Result><AlarmID>7</AlarmID><Code>0</Code><Extra>x</Extra></Result>"
             "<Result><AlarmID>8</AlarmID></Result></ProcessAlarmRes>";
-        QCOMPARE(read(Process, {true, "", "0", results, true}).result.toList(),
+        QCOMPARE(readReply(Reader::Process, {true, "", "0", results, true}).result.toList(),
                  (QVariantList{QVariantMap{{"alarmId", "7"}, {"updateResult", "0"}},
                                QVariantMap{{"alarmId", "8"}, {"updateResult", ""}}}));
 
         const QString changes = "<GetAlarmInfoRes><Alarm><AlarmID>1</AlarmID><ChangeLogs>"
                                 "<Entry><State>A</State></Entry><Entry><State>B</State><Note>n"
                                 "</Note></Entry><Entry/></ChangeLogs></Alarm></GetAlarmInfoRes>";
-        QCOMPARE(read(Info, {true, "", "0", changes, true}).result.toList(),
+        QCOMPARE(readReply(Reader::Info, {true, "", "0", changes, true}).result.toList(),
                  (QVariantList{QVariantMap{{"State", "A"}},
                                QVariantMap{{"State", "B"}, {"Note", "n"}}, QString()}));
         // A single entry is a list of one.
         const QString single = "<GetAlarmInfoRes><Alarm><ChangeLogs><Entry><State>A</State>"
                                "</Entry></ChangeLogs></Alarm></GetAlarmInfoRes>";
-        QCOMPARE(read(Info, {true, "", "0", single, true}).result.toList(),
+        QCOMPARE(readReply(Reader::Info, {true, "", "0", single, true}).result.toList(),
                  (QVariantList{QVariantMap{{"State", "A"}}}));
     }
 };
