@@ -81,8 +81,7 @@ private slots:
         QFETCH_GLOBAL(int, moduleId);
         m_outputs = outputs;
         m_checks = libraryPresent && context;
-        m_moduleId = moduleId;
-        g_nGivenModIdAlarmSearchSrv = moduleId;
+        m_moduleId = g_nGivenModIdAlarmSearchSrv = moduleId;
         if (libraryPresent) {
             *g_ptTraceInfoAlarmSearchSrv = m_loaded;
             if (!outputs)
@@ -93,72 +92,65 @@ private slots:
         m_recorder.reset();
     }
 
-    void entryLog_data()
+    // An entry log writes its entry line at construction and its exit line (checked with line 0)
+    // at destruction; a failure line's arguments are evaluated only when the check passes.
+    void lines_data()
     {
-        QTest::addColumn<bool>("throws");
-        QTest::addColumn<bool>("refused");
-        QTest::newRow("returns") << false << false;
-        QTest::newRow("throws") << true << false;
-        QTest::newRow("refused") << false << true;
-    }
-
-    void entryLog()
-    {
-        QFETCH(bool, throws);
-        QFETCH(bool, refused);
-        if (refused)
-            m_recorder.refuse(levelCode(m_moduleId, AlarmSearchTrace::LevelEntry));
-        QStringList atEnter;
-        const int line = __LINE__;
-        try {
-            EntryLog log(__FILE__, "X", line);
-            atEnter = m_recorder.journal();
-            if (throws)
-                throw std::runtime_error("left by an exception");
-        } catch (const std::runtime_error&) {
-        }
-        const QStringList enter = expected(AlarmSearchTrace::LevelEntry, line, "X, Enter", refused);
-        const QStringList leave = expected(AlarmSearchTrace::LevelEntry, 0, "X, Leave", refused);
-        QCOMPARE(atEnter, enter);
-        QCOMPARE(m_recorder.journal(), enter + leave);
-    }
-
-    // The arguments of a failure line are evaluated only when the check lets it through.
-    void failureLine_data()
-    {
+        QTest::addColumn<int>("kind");
         QTest::addColumn<QString>("status");
-        QTest::addColumn<QString>("written");
         QTest::addColumn<bool>("refused");
-        QTest::newRow("status") << "80000001"
-                                << "queryAlarmCB, failed, 80000001" << false;
-        QTest::newRow("null") << QString() << "queryAlarmCB, failed, " << false;
-        QTest::newRow("empty") << ""
-                               << "queryAlarmCB, failed, " << false;
-        QTest::newRow("percent signs stay text") << "100% %s %n"
-                                                 << "queryAlarmCB, failed, 100% %s %n" << false;
-        QTest::newRow("non-ASCII") << QStringLiteral("St\u00f6rung")
-                                   << QStringLiteral("queryAlarmCB, failed, St\u00f6rung") << false;
-        QTest::newRow("refused") << "1"
-                                 << "queryAlarmCB, failed, 1" << true;
+        QTest::addColumn<QStringList>("written");
+        const QStringList entry{"X, Enter", "X, Leave"};
+        QTest::newRow("entry") << int(Entry) << QString() << false << entry;
+        QTest::newRow("entry left by an exception")
+            << int(EntryThrows) << QString() << false << entry;
+        QTest::newRow("entry refused") << int(Entry) << QString() << true << entry;
+        const auto failure = [](const char* name, const QString& status, bool refused = false) {
+            QTest::newRow(name) << int(Failure) << status << refused
+                                << QStringList{"queryAlarmCB, failed, " + status};
+        };
+        failure("failure", "80000001");
+        failure("failure, null status", QString());
+        failure("failure, percent signs stay text", "100% %s %n");
+        failure("failure, non-ASCII", QStringLiteral("St\u00f6rung"));
+        failure("failure refused", "1", true);
     }
 
-    void failureLine()
+    void lines()
     {
+        QFETCH(int, kind);
         QFETCH(QString, status);
-        QFETCH(QString, written);
         QFETCH(bool, refused);
+        QFETCH(QStringList, written);
+        const int level =
+            kind == Failure ? AlarmSearchTrace::LevelFailure : AlarmSearchTrace::LevelEntry;
         if (refused)
-            m_recorder.refuse(levelCode(m_moduleId, AlarmSearchTrace::LevelFailure));
+            m_recorder.refuse(levelCode(m_moduleId, level));
         int evaluated = 0;
         const auto argument = [&] {
             ++evaluated;
             return AlarmSearchTrace::text(status);
         };
-        const int line = __LINE__ + 1;
-        ALARMSEARCH_TRACE_FAILURE("%s, failed, %s", "queryAlarmCB", argument().constData());
-        QCOMPARE(evaluated, m_checks && !refused ? 1 : 0);
-        QCOMPARE(m_recorder.journal(),
-                 expected(AlarmSearchTrace::LevelFailure, line, written, refused));
+        QStringList atEnter;
+        const int line = __LINE__ + 2;
+        if (kind == Failure)
+            ALARMSEARCH_TRACE_FAILURE("%s, failed, %s", "queryAlarmCB", argument().constData());
+        try {
+            if (kind != Failure) {
+                EntryLog log(__FILE__, "X", line);
+                atEnter = m_recorder.journal();
+                if (kind == EntryThrows)
+                    throw std::runtime_error("left by an exception");
+            }
+        } catch (const std::runtime_error&) {
+        }
+        QStringList expectedJournal;
+        for (int i = 0; i < written.size(); ++i)
+            expectedJournal << expected(level, i ? 0 : line, written.at(i), refused);
+        if (kind != Failure)
+            QCOMPARE(atEnter, expected(level, line, written.first(), refused));
+        QCOMPARE(evaluated, kind == Failure && m_checks && !refused ? 1 : 0);
+        QCOMPARE(m_recorder.journal(), expectedJournal);
     }
 
     // Last: a second owner loads and registers again, and closing it turns tracing off so that
@@ -172,13 +164,14 @@ private slots:
             AUTOLOGGER_AlarmSearchSrv second;
         }
         QCOMPARE(g_ptTraceInfoAlarmSearchSrv, nullptr);
-        QCOMPARE(m_recorder.journal(), registers ? registration : QStringList());
         QVERIFY(!AlarmSearchTrace::check(AlarmSearchTrace::LevelFailure, __FILE__, __LINE__));
         LocalTraceOutFuncAlarmSearchSrv("%s", "after unload");
         QCOMPARE(m_recorder.journal(), registers ? registration : QStringList());
     }
 
 private:
+    enum Kind { Entry, EntryThrows, Failure };
+
     // Journal entries of one line at level from this file's line.
     QStringList expected(int level, int line, const QString& text, bool refused) const
     {
@@ -242,10 +235,10 @@ private slots:
         for (const char* name : {"RequestBlock", "SubscribeEventBlock", "UnsubscribeEventBlock",
                                  "~PluginAlarmSearchSrv"})
             call(name);
-        QCOMPARE(m_recorder.lines(), expected);
+        QCOMPARE(m_recorder.entries(), expected);
 
         // Entry lines are checked with the operation's line, exit lines with line 0.
-        const QStringList checks = m_recorder.checks();
+        const QStringList checks = m_recorder.entries("check ");
         QCOMPARE(checks.size(), expected.size());
         const auto checked = [&checks](int i, const char* pattern) {
             return checks.at(i).contains(QRegularExpression(QString::fromUtf8(pattern)));
@@ -262,30 +255,28 @@ private slots:
         QTest::addColumn<QString>("status");
         QTest::addColumn<QString>("reply");
         QTest::addColumn<QStringList>("lines");
-        const auto line = [](const char* text) { return QStringList{QString::fromUtf8(text)}; };
-        QTest::newRow("query rejected")
-            << 0 << true << "80000000"
-            << "<QryAlarmListRes/>" << line("queryAlarmCB, QryAlarmList failed, 80000000");
-        QTest::newRow("query transport")
-            << 0 << false << "0"
-            << "<QryAlarmListRes/>" << line("queryAlarmCB, QryAlarmList failed, 0");
-        QTest::newRow("process rejected")
-            << 1 << true << "FFFFFFFF"
-            << "<ProcessAlarmRes/>" << line("processAlarmCB, processAlarm failed, FFFFFFFF");
-        QTest::newRow("info null status") << 2 << false << QString() << "<GetAlarmInfoRes/>"
-                                          << line("getAlarmInfoCB, getAlarmInfo failed, ");
-        QTest::newRow("query unparseable")
-            << 0 << true << "0"
-            << "<QryAlarmListRes>" << line("queryAlarmCB, parse message failed, <QryAlarmListRes>");
-        QTest::newRow("process unparseable")
-            << 1 << true << "0"
-            << "caf\u00e9 100%s" << line("processAlarmCB, parse message failed, caf\u00e9 100%s");
-        QTest::newRow("info empty reply")
-            << 2 << true << "0" << QString() << line("getAlarmInfoCB, parse message failed, ");
-        QTest::newRow("process accepted") << 1 << true << "0"
-                                          << "<ProcessAlarmRes/>" << QStringList();
-        QTest::newRow("info accepted") << 2 << true << "0"
-                                       << "<GetAlarmInfoRes/>" << QStringList();
+        const auto row = [](const char* name, Reader reader, bool ok, const QString& status,
+                            const QString& reply, const QString& line = {}) {
+            QTest::newRow(name) << int(reader) << ok << status << reply
+                                << (line.isEmpty() ? QStringList() : QStringList{line});
+        };
+        const Reader query = Reader::Query, process = Reader::Process, info = Reader::Info;
+        row("query rejected", query, true, "80000000", "<QryAlarmListRes/>",
+            "queryAlarmCB, QryAlarmList failed, 80000000");
+        row("query transport", query, false, "0", "<QryAlarmListRes/>",
+            "queryAlarmCB, QryAlarmList failed, 0");
+        row("process rejected", process, true, "FFFFFFFF", "<ProcessAlarmRes/>",
+            "processAlarmCB, processAlarm failed, FFFFFFFF");
+        row("info null status", info, false, QString(), "<GetAlarmInfoRes/>",
+            "getAlarmInfoCB, getAlarmInfo failed, ");
+        row("query unparseable", query, true, "0", "<QryAlarmListRes>",
+            "queryAlarmCB, parse message failed, <QryAlarmListRes>");
+        row("process unparseable", process, true, "0", "caf\u00e9 100%s",
+            "processAlarmCB, parse message failed, caf\u00e9 100%s");
+        row("info empty reply", info, true, "0", QString(),
+            "getAlarmInfoCB, parse message failed, ");
+        row("process accepted", process, true, "0", "<ProcessAlarmRes/>");
+        row("info accepted", info, true, "0", "<GetAlarmInfoRes/>");
     }
 
     void readerFailureLines()
@@ -296,8 +287,8 @@ private slots:
         QFETCH(QString, reply);
         QFETCH(QStringList, lines);
         readReply(Reader(reader), {ok, "r", status, reply, true});
-        QCOMPARE(m_recorder.lines(), lines);
-        for (const QString& check : m_recorder.checks())
+        QCOMPARE(m_recorder.entries(), lines);
+        for (const QString& check : m_recorder.entries("check "))
             QVERIFY(check.startsWith("10754 0 "));
     }
 
