@@ -368,12 +368,9 @@ private slots:
         QTest::addColumn<bool>("written");
         QTest::newRow("default writes failures") << QByteArray() << 2 << true;
         QTest::newRow("default skips level 3") << QByteArray() << 3 << false;
-        QTest::newRow("default skips entry lines") << QByteArray() << 5 << false;
         QTest::newRow("5 writes entry lines") << QByteArray("5") << 5 << true;
         QTest::newRow("5 skips level 6") << QByteArray("5") << 6 << false;
         QTest::newRow("0 writes nothing") << QByteArray("0") << 2 << false;
-        QTest::newRow("0 skips level 1") << QByteArray("0") << 1 << false;
-        QTest::newRow("1 writes level 1") << QByteArray("1") << 1 << true;
         QTest::newRow("invalid keeps default") << QByteArray("verbose") << 2 << true;
         QTest::newRow("invalid keeps default, level 5") << QByteArray("5x") << 5 << false;
     }
