@@ -100,25 +100,16 @@ private slots:
         QVERIFY(!isWellFormed(QStringLiteral("<a>\x01</a>")));
     }
 
-    void emptyQuery()
-    {
-        QCOMPARE(
-            composer.composeQueryAlarmListMessage(QVariantMap()),
-            QStringLiteral("<QryAlarmList><Filters><TriggerEventList/></Filters><TmBound>"
-                           "<TZ>+00:00</TZ><StartTm/><EndTm/></TmBound><TmBase useUTC=\"true\">"
-                           "Station</TmBase><MaxRec>5000</MaxRec><OrderBy><Field>ServerTime"
-                           "</Field><Descending>true</Descending></OrderBy></QryAlarmList>"));
-    }
-
-    void nonMapArgument_data()
+    void noFilters_data()
     {
         QTest::addColumn<QVariant>("args");
+        QTest::newRow("empty map") << QVariant(QVariantMap());
         QTest::newRow("invalid") << QVariant();
         QTest::newRow("text") << QVariant(QStringLiteral("<Filters/>"));
         QTest::newRow("list") << QVariant(QVariantList{ARG_START_TIME, QStringLiteral("x")});
     }
 
-    void nonMapArgument()
+    void noFilters()
     {
         QFETCH(QVariant, args);
         QCOMPARE(composer.composeQueryAlarmListMessage(args), expectedQuery("<TriggerEventList/>"));
