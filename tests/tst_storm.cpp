@@ -38,31 +38,20 @@ const QString rejectedStatus = QStringLiteral("80000000");
 
 QString methodOf(Kind kind)
 {
-    switch (kind) {
-    case Kind::Query:
-        return METHOD_QUERY_ALARM_LIST;
-    case Kind::Update:
-        return METHOD_UPDATE_ALARM;
-    case Kind::History:
-        break;
-    }
-    return METHOD_GET_ALARM_HISTORY;
+    const QString methods[] = {METHOD_QUERY_ALARM_LIST, METHOD_UPDATE_ALARM,
+                               METHOD_GET_ALARM_HISTORY};
+    return methods[int(kind)];
 }
 
 QString acceptedReply(Kind kind)
 {
-    switch (kind) {
-    case Kind::Query:
-        return QStringLiteral("<QryAlarmListRes><Alarm><ID>1</ID></Alarm></QryAlarmListRes>");
-    case Kind::Update:
-        return QStringLiteral("<ProcessAlarmRes><Result><AlarmID>A1</AlarmID><Code>0</Code>"
-                              "</Result><Result><AlarmID>A2</AlarmID><Code>1</Code></Result>"
-                              "</ProcessAlarmRes>");
-    case Kind::History:
-        break;
-    }
-    return QStringLiteral("<GetAlarmInfoRes><Alarm><ChangeLogs><Entry><Note>n</Note></Entry>"
-                          "</ChangeLogs></Alarm></GetAlarmInfoRes>");
+    const char* const replies[] = {
+        "<QryAlarmListRes><Alarm><ID>1</ID></Alarm></QryAlarmListRes>",
+        "<ProcessAlarmRes><Result><AlarmID>A1</AlarmID><Code>0</Code></Result><Result><AlarmID>A2"
+        "</AlarmID><Code>1</Code></Result></ProcessAlarmRes>",
+        "<GetAlarmInfoRes><Alarm><ChangeLogs><Entry><Note>n</Note></Entry></ChangeLogs></Alarm>"
+        "</GetAlarmInfoRes>"};
+    return QString::fromUtf8(replies[int(kind)]);
 }
 
 // Delivers the reply of the given outcome to a recorded request.
@@ -91,15 +80,15 @@ QString expectedCode(Kind kind, Outcome outcome)
 class Tally
 {
 public:
-    explicit Tally(int requests) : m_answers(requests) {}
+    explicit Tally(int requests) { m_counts.answers.resize(requests); }
 
     HDLR_DO_REQUEST_CB answerSink(int index)
     {
         return [this, index](bool, const QString& code, const QString&, const QVariant&) {
             std::lock_guard lock(m_mutex);
-            m_answers[index].append(code);
+            m_counts.answers[index].append(code);
             if (kindOf(index) == Kind::Update && m_pluginDeleted)
-                ++m_updateAnswersAfterDeletion;
+                ++m_counts.updateAnswersAfterDeletion;
         };
     }
 
@@ -113,10 +102,10 @@ public:
                 kindOf(index) == Kind::Update && outcomeOf(index) == Outcome::Accepted;
             if (!understoodUpdate || !m_everSubscribed.contains(info->subscriptionKey) ||
                 data.value(ARG_ALARM_UPDATED_RESULTS).toList().size() != 2 || m_pluginDeleted)
-                ++m_badEvents;
+                ++m_counts.badEvents;
             if (info->subscriptionKey == permanentKey)
-                m_permanentEvents.append(index);
-            ++m_events;
+                m_counts.permanentEvents.append(index);
+            ++m_counts.events;
         };
     }
 
@@ -133,41 +122,25 @@ public:
         m_pluginDeleted = true;
     }
 
-    QList<QStringList> answers() const
+    struct Counts
+    {
+        QList<QStringList> answers;
+        QList<int> permanentEvents;
+        int events = 0;
+        int badEvents = 0;
+        int updateAnswersAfterDeletion = 0;
+    };
+    Counts counts() const
     {
         std::lock_guard lock(m_mutex);
-        return m_answers;
-    }
-    QList<int> permanentEvents() const
-    {
-        std::lock_guard lock(m_mutex);
-        return m_permanentEvents;
-    }
-    int events() const
-    {
-        std::lock_guard lock(m_mutex);
-        return m_events;
-    }
-    int badEvents() const
-    {
-        std::lock_guard lock(m_mutex);
-        return m_badEvents;
-    }
-    int updateAnswersAfterDeletion() const
-    {
-        std::lock_guard lock(m_mutex);
-        return m_updateAnswersAfterDeletion;
+        return m_counts;
     }
 
 private:
     mutable std::mutex m_mutex;
-    QList<QStringList> m_answers;
+    Counts m_counts;
     QSet<QString> m_everSubscribed;
-    QList<int> m_permanentEvents;
-    int m_events = 0;
-    int m_badEvents = 0;
     bool m_pluginDeleted = false;
-    int m_updateAnswersAfterDeletion = 0;
 };
 
 // A started plug-in whose host events go to the tally, with the given requests pending.
@@ -250,7 +223,8 @@ private slots:
         subscriber.join();
 
         // Every reply produced exactly one answer, with the code its kind and outcome call for.
-        const QList<QStringList> answers = storm.tally.answers();
+        const Tally::Counts counts = storm.tally.counts();
+        const QList<QStringList>& answers = counts.answers;
         QList<int> understoodUpdates;
         for (int i = 0; i < Requests; ++i) {
             QCOMPARE(answers.at(i), QStringList{expectedCode(kindOf(i), outcomeOf(i))});
@@ -259,11 +233,11 @@ private slots:
         }
         // Events came only for understood updates, and the key that stayed subscribed throughout
         // saw each of them exactly once.
-        QCOMPARE(storm.tally.badEvents(), 0);
-        QList<int> permanentEvents = storm.tally.permanentEvents();
+        QCOMPARE(counts.badEvents, 0);
+        QList<int> permanentEvents = counts.permanentEvents;
         std::sort(permanentEvents.begin(), permanentEvents.end());
         QCOMPARE(permanentEvents, understoodUpdates);
-        QVERIFY(storm.tally.events() >= understoodUpdates.size());
+        QVERIFY(counts.events >= understoodUpdates.size());
     }
 
     void deletionWithRepliesPending()
@@ -297,15 +271,16 @@ private slots:
         // Queries and history reads need nothing of the plug-in and are answered every time;
         // an update is answered at most once, never after the deletion, and publishes nothing
         // then.
-        const QList<QStringList> answers = storm.tally.answers();
+        const Tally::Counts counts = storm.tally.counts();
+        const QList<QStringList>& answers = counts.answers;
         for (int i = 0; i < Requests; ++i) {
             if (kindOf(i) == Kind::Update)
                 QVERIFY(answers.at(i).size() <= 1);
             else
                 QCOMPARE(answers.at(i).size(), 2);
         }
-        QCOMPARE(storm.tally.updateAnswersAfterDeletion(), 0);
-        QCOMPARE(storm.tally.badEvents(), 0);
+        QCOMPARE(counts.updateAnswersAfterDeletion, 0);
+        QCOMPARE(counts.badEvents, 0);
     }
 };
 

@@ -1,4 +1,7 @@
-#include "support/FakeTunnelClient.h"
+// The tunnel control: what it hands the tunnel for each operation, and what its readers make of
+// the replies.
+
+#include "support/ReaderRun.h"
 
 #include <MessageComposer.h>
 #include <ORVOSrvTunnelControl.h>
@@ -6,7 +9,6 @@
 
 #include <QtTest>
 
-#include <thread>
 #include <type_traits>
 
 using namespace PluginAlarmSearchCommon;
@@ -19,31 +21,55 @@ static_assert(std::is_polymorphic_v<ORVOSrvTunnelControl> &&
 
 namespace {
 
-struct Outcome
+// Writes back the arguments it is given, so that a test sees what the control handed it; a
+// value "bad" makes a command it cannot write.
+struct EchoComposer : MessageComposer
 {
-    int calls = 0;
-    bool ok = false;
-    bool isLast = false;
-    QVariant result;
-    QString statusText;
-    QString relayPath;
+    static QString unless(const QString& text) { return text.contains("bad") ? QString() : text; }
+    QString composeQueryAlarmListMessage(const QVariant& args) override
+    {
+        return unless("query " + args.toMap().value(ARG_STATE_FILTER).toString());
+    }
+    QString composeProcessAlarmMessage(const QList<QString>& ids, const QVariantMap& status,
+                                       const QString& note) override
+    {
+        return unless("process " + ids.join(',') + ' ' + status.value(ARG_ALARM_STATUS).toString() +
+                      ' ' + note);
+    }
+    QString composeGetAlarmInfoMessage(const QString& alarmId) override
+    {
+        return unless("info " + alarmId);
+    }
+    QString composeMuteAlarmMessage(const QList<QString>& ids, bool mute, int interval) override
+    {
+        return unless(QStringLiteral("mute %1 %2 %3").arg(ids.join(',')).arg(mute).arg(interval));
+    }
 };
 
-ORVOSrvTunnelControl::QueryAlarmCompletion recordQuery(Outcome& out)
-{
-    return
-        [&out](bool ok, bool isLast, const QVariant& result, const QString& status,
-               const QString& relay) { out = {out.calls + 1, ok, isLast, result, status, relay}; };
-}
-
-ORVOSrvTunnelControl::ReplyCompletion recordReply(Outcome& out)
-{
-    return [&out](bool ok, bool isLast, const QVariant& result, const QString& relay) {
-        out = {out.calls + 1, ok, isLast, result, QString(), relay};
-    };
-}
+enum Operation { Query, Process, Info, Mute };
+using Outcome = ReaderOutcome;
 
 void* const client = reinterpret_cast<void*>(0x1234);
+
+// Runs one operation with the given request values; returns whether the control says it sent.
+bool run(ORVOSrvTunnelControl& control, Operation operation, const QVariant& args, Outcome& out)
+{
+    const QVariantMap map = args.toMap();
+    const QStringList ids = map.value(ARG_ALARMINFO_ID_LIST).toStringList();
+    switch (operation) {
+    case Query:
+        return control.queryAlarm(client, args, recordQuery(out));
+    case Process:
+        return control.processAlarm(client, map, recordReply(out));
+    case Info:
+        return control.getAlarmInfo(client, ids.value(0), map.value(ARG_RELAY_PATH).toString(),
+                                    recordReply(out));
+    case Mute:
+        control.muteAlarm(client, ids, true, 60);
+        return true;
+    }
+    return false;
+}
 
 const QString threeAlarms = QStringLiteral(
     "<QryAlarmListRes><Alarm><AlarmID>1</AlarmID></Alarm><Other/>"
@@ -56,352 +82,182 @@ class TestTunnelControl : public QObject
     Q_OBJECT
 
 private slots:
-    void requestRecords_data()
+    void requests_data()
     {
         QTest::addColumn<int>("operation");
+        QTest::addColumn<QVariant>("args");
+        QTest::addColumn<QString>("command"); // empty: nothing is sent
         QTest::addColumn<QString>("method");
-        QTest::addColumn<int>("kind");
-        QTest::addColumn<QString>("commandText");
         QTest::addColumn<QString>("relayPath");
-        QTest::addColumn<bool>("hasCallback");
 
-        MessageComposer composer;
-        const QVariantMap query{{ARG_STATE_FILTER, "<S/>"}, {ARG_RELAY_PATH, "relay/q"}};
-        QTest::newRow("query") << 0 << "QryAlarmList" << 4
-                               << composer.composeQueryAlarmListMessage(query) << "relay/q" << true;
-        QTest::newRow("process") << 1 << "ProcessAlarm" << 4
-                                 << composer.composeProcessAlarmMessage(
-                                        {"7", "8"}, {{ARG_ALARM_STATUS, "Handled"}}, "done")
-                                 << "relay/p" << true;
-        QTest::newRow("info") << 2 << "GetAlarmInfo" << 4
-                              << composer.composeGetAlarmInfoMessage("42") << "relay/i" << true;
-        QTest::newRow("mute") << 3 << "MuteAlarm" << 2
-                              << composer.composeMuteAlarmMessage({"7"}, true, 60) << QString()
-                              << false;
+        const QVariantMap process{
+            {ARG_ALARMINFO_ID_LIST, QStringList{"7", "8"}},
+            {ARG_ALARMINFO_STATUS, QVariantMap{{ARG_ALARM_STATUS, "Handled"}}},
+            {ARG_ALARMINFO_NOTE, "done"},
+            {ARG_RELAY_PATH, "relay/p"}};
+        const QVariantMap ids{{ARG_ALARMINFO_ID_LIST, QStringList{"7"}}, {ARG_RELAY_PATH, "r/i"}};
+        QTest::newRow("query") << int(Query)
+                               << QVariant(QVariantMap{{ARG_STATE_FILTER, "<S/>"},
+                                                       {ARG_RELAY_PATH, "relay/q"}})
+                               << "query <S/>"
+                               << "QryAlarmList"
+                               << "relay/q";
+        QTest::newRow("query, not a map") << int(Query) << QVariant("<S/>") << "query "
+                                          << "QryAlarmList" << QString();
+        QTest::newRow("process") << int(Process) << QVariant(process) << "process 7,8 Handled done"
+                                 << "ProcessAlarm"
+                                 << "relay/p";
+        QTest::newRow("info") << int(Info) << QVariant(ids) << "info 7"
+                              << "GetAlarmInfo"
+                              << "r/i";
+        QTest::newRow("mute") << int(Mute) << QVariant(ids) << "mute 7 1 60"
+                              << "MuteAlarm" << QString();
+        const QVariantMap bad{{ARG_STATE_FILTER, "bad"},
+                              {ARG_ALARMINFO_ID_LIST, QStringList{"bad"}}};
+        for (const Operation operation : {Query, Process, Info, Mute})
+            QTest::addRow("unwritable, operation %d", operation)
+                << int(operation) << QVariant(bad) << QString() << QString() << QString();
     }
 
-    void requestRecords()
+    // The control sends what its composer writes, and nothing when the composer cannot write it.
+    void requests()
     {
         QFETCH(int, operation);
+        QFETCH(QVariant, args);
+        QFETCH(QString, command);
         QFETCH(QString, method);
-        QFETCH(int, kind);
-        QFETCH(QString, commandText);
         QFETCH(QString, relayPath);
-        QFETCH(bool, hasCallback);
 
         FakeTunnelClient tunnel;
         ORVOSrvTunnelControl control(&tunnel);
+        control.setMessageComposer(QSharedPointer<EchoComposer>::create());
         Outcome outcome;
-        switch (operation) {
-        case 0:
-            QVERIFY(control.queryAlarm(
-                client, QVariantMap{{ARG_STATE_FILTER, "<S/>"}, {ARG_RELAY_PATH, "relay/q"}},
-                recordQuery(outcome)));
-            break;
-        case 1:
-            QVERIFY(control.processAlarm(
-                client,
-                {{ARG_ALARMINFO_ID_LIST, QStringList{"7", "8"}},
-                 {ARG_ALARMINFO_STATUS, QVariantMap{{ARG_ALARM_STATUS, "Handled"}}},
-                 {ARG_ALARMINFO_NOTE, "done"},
-                 {ARG_RELAY_PATH, "relay/p"}},
-                recordReply(outcome)));
-            break;
-        case 2:
-            QVERIFY(control.getAlarmInfo(client, "42", "relay/i", recordReply(outcome)));
-            break;
-        case 3:
-            control.muteAlarm(client, {"7"}, true, 60);
-            break;
+        QCOMPARE(run(control, Operation(operation), args, outcome),
+                 !command.isEmpty() || operation == Mute);
+        QCOMPARE(outcome.calls, 0); // nothing is answered before a reply arrives
+        if (command.isEmpty()) {
+            QCOMPARE(tunnel.records().size(), 0);
+            return;
         }
-
-        const QList<FakeTunnelClient::Record> records = tunnel.records();
-        QCOMPARE(records.size(), 1);
-        const FakeTunnelClient::Record& r = records.first();
+        QCOMPARE(tunnel.records().size(), 1);
+        const FakeTunnelClient::Record& r = tunnel.last();
         QCOMPARE(r.pluginId, QStringLiteral("C758778662E44060AC6E2EC5C9AD349B"));
         QCOMPARE(r.clientID, client);
-        QCOMPARE(r.kind, kind);
+        QCOMPARE(r.kind, operation == Mute ? 2 : 4);
         QCOMPARE(r.method, method);
         QCOMPARE(r.urgent, false);
         QCOMPARE(r.timeoutMs, 15000);
-        QCOMPARE(r.commandText, commandText);
+        QCOMPARE(r.commandText, command);
         QCOMPARE(r.relayPath, relayPath);
-        QCOMPARE(bool(r.replyCallback), hasCallback);
-        QCOMPARE(outcome.calls, 0); // nothing is answered before a reply arrives
+        QCOMPARE(bool(r.replyCallback), operation != Mute);
+        if (r.replyCallback) {
+            tunnel.reply({true, "r", "0", threeAlarms, true});
+            QCOMPARE(outcome.calls, 1);
+        }
     }
 
+    // A refused request, or one without a tunnel client, is refused and never answered.
     void refusedAndMissingClient()
     {
         FakeTunnelClient tunnel;
         tunnel.setAccept(false);
         ORVOSrvTunnelControl refusing(&tunnel);
+        ORVOSrvTunnelControl detached(nullptr);
         Outcome outcome;
-        QVERIFY(!refusing.queryAlarm(client, QVariant(), recordQuery(outcome)));
-        QVERIFY(!refusing.processAlarm(client, {}, recordReply(outcome)));
-        QVERIFY(!refusing.getAlarmInfo(client, "1", "r", recordReply(outcome)));
-        refusing.muteAlarm(client, {}, false, 0); // result ignored
+        const QVariantMap args{{ARG_ALARMINFO_ID_LIST, QStringList{"1"}}};
+        for (ORVOSrvTunnelControl* control : {&refusing, &detached})
+            for (const Operation operation : {Query, Process, Info})
+                QVERIFY(!run(*control, operation, args, outcome));
+        run(refusing, Mute, args, outcome);
+        run(detached, Mute, args, outcome);
         QCOMPARE(tunnel.records().size(), 4);
         QCOMPARE(outcome.calls, 0);
-
-        // A control around no tunnel client refuses everything instead of crashing.
-        ORVOSrvTunnelControl detached(nullptr);
-        IOrvoTunnelClient::InsertRequestInfo info;
-        QVERIFY(!detached.sendCommand(client, METHOD_QUERY_ALARM_LIST, info));
-        QVERIFY(!detached.queryAlarm(client, QVariant(), recordQuery(outcome)));
-        QVERIFY(!detached.processAlarm(client, {}, recordReply(outcome)));
-        QVERIFY(!detached.getAlarmInfo(client, "1", "r", recordReply(outcome)));
-        detached.muteAlarm(client, {"1"}, true, 5);
-        QCOMPARE(outcome.calls, 0);
     }
 
-    // A request the composer cannot write goes nowhere and is refused like a failed send.
-    void unwritableRequestsAreNotSent()
-    {
-        FakeTunnelClient tunnel;
-        ORVOSrvTunnelControl control(&tunnel);
-        Outcome outcome;
-        const QString deep = QStringLiteral("<e>").repeated(5000);
-        const QString badId = QStringLiteral("A1\x01");
-        QVERIFY(!control.queryAlarm(client, QVariantMap{{ARG_STATE_FILTER, deep}},
-                                    recordQuery(outcome)));
-        QVERIFY(!control.processAlarm(client, {{ARG_ALARMINFO_ID_LIST, QStringList{badId}}},
-                                      recordReply(outcome)));
-        QVERIFY(!control.getAlarmInfo(client, badId, "r", recordReply(outcome)));
-        control.muteAlarm(client, {badId}, true, 5);
-        QCOMPARE(tunnel.records().size(), 0);
-        QCOMPARE(outcome.calls, 0);
-    }
-
-    void nonMapArgumentsStillQuery()
-    {
-        FakeTunnelClient tunnel;
-        ORVOSrvTunnelControl control(&tunnel);
-        Outcome outcome;
-        QVERIFY(control.queryAlarm(client, QVariant(QStringLiteral("not a map")),
-                                   recordQuery(outcome)));
-        QCOMPARE(tunnel.last().commandText,
-                 MessageComposer().composeQueryAlarmListMessage(QVariantMap()));
-        QCOMPARE(tunnel.last().relayPath, QString());
-    }
-
-    // Every reader judges the status the same way; flags and relay path pass through on every
-    // path.
-    void statusJudging_data()
+    // Every reader judges the status and reads the reply the same way; flags and relay path pass
+    // through on every path.
+    void readers_data()
     {
         QTest::addColumn<bool>("ok");
         QTest::addColumn<QString>("status");
-        QTest::addColumn<bool>("accepted");
-        QTest::newRow("0") << true << "0" << true;
-        QTest::newRow("7FFFFFFF") << true << "7FFFFFFF" << true;
-        QTest::newRow("empty") << true << "" << true;
-        QTest::newRow("not hex") << true << "xyz" << true;
-        QTest::newRow("80000000") << true << "80000000" << false;
-        QTest::newRow("FFFFFFFF") << true << "FFFFFFFF" << false;
-        QTest::newRow("lower-case c0000001") << true << "c0000001" << false;
-        QTest::newRow("bit 31 of a 64-bit status") << true << "180000000" << false;
-        QTest::newRow("transport failure") << false << "0" << false;
+        QTest::addColumn<QString>("reply");
+        QTest::addColumn<QList<int>>("items"); // per reader; empty: refused
+
+        const QString one = QStringLiteral("<QryAlarmListRes><Alarm/></QryAlarmListRes>");
+        const QList<int> read{1, 0, 0};
+        for (const char* status : {"0", "7FFFFFFF", "", "xyz"})
+            QTest::addRow("status %s", status) << true << status << one << read;
+        for (const char* status : {"80000000", "FFFFFFFF", "c0000001", "180000000"})
+            QTest::addRow("status %s", status) << true << status << one << QList<int>();
+        QTest::newRow("transport failure") << false << "0" << one << QList<int>();
+        for (const char* reply : {"", "this is not xml", "<QryAlarmListRes><Alarm>", "<A/><B/>"})
+            QTest::addRow("unparseable %s", reply) << true << "0" << reply << QList<int>();
+        QTest::newRow("other root")
+            << true << "0"
+            << "<Unexpected><Alarm/><Result/></Unexpected>" << QList<int>{0, 0, 0};
+        QTest::newRow("empty root") << true << "0"
+                                    << "<QryAlarmListRes/>" << QList<int>{0, 0, 0};
+        QTest::newRow("info without change log")
+            << true << "0"
+            << "<GetAlarmInfoRes><Alarm><AlarmID>1</AlarmID></Alarm></GetAlarmInfoRes>"
+            << QList<int>{0, 0, 0};
     }
 
-    void statusJudging()
+    void readers()
     {
         QFETCH(bool, ok);
         QFETCH(QString, status);
-        QFETCH(bool, accepted);
-
+        QFETCH(QString, reply);
+        QFETCH(QList<int>, items);
         for (const bool isLast : {false, true}) {
-            const FakeTunnelClient::Reply reply{
-                ok, "relay/x", status, "<QryAlarmListRes><Alarm/></QryAlarmListRes>", isLast};
-            FakeTunnelClient tunnel;
-            ORVOSrvTunnelControl control(&tunnel);
-
-            Outcome query;
-            control.queryAlarm(client, QVariant(), recordQuery(query));
-            tunnel.reply(reply);
-            QCOMPARE(query.calls, 1);
-            QCOMPARE(query.ok, accepted);
-            QCOMPARE(query.isLast, isLast);
-            QCOMPARE(query.statusText, status);
-            QCOMPARE(query.relayPath, QStringLiteral("relay/x"));
-            QCOMPARE(query.result.isValid(), accepted);
-
-            Outcome process;
-            control.processAlarm(client, {}, recordReply(process));
-            tunnel.reply(reply);
-            QCOMPARE(process.ok, accepted);
-            QCOMPARE(process.isLast, isLast);
-            QCOMPARE(process.relayPath, QStringLiteral("relay/x"));
-            QCOMPARE(process.result.isValid(), accepted);
-
-            Outcome info;
-            control.getAlarmInfo(client, "1", "ignored", recordReply(info));
-            tunnel.reply(reply);
-            QCOMPARE(info.ok, accepted);
-            QCOMPARE(info.isLast, isLast);
-            QCOMPARE(info.relayPath, QStringLiteral("relay/x"));
-            QCOMPARE(info.result.isValid(), accepted);
+            for (const Operation reader : {Query, Process, Info}) {
+                const Outcome o = readReply(Reader(reader), {ok, "relay/x", status, reply, isLast});
+                QCOMPARE(o.calls, 1);
+                QCOMPARE(o.ok, !items.isEmpty());
+                QCOMPARE(o.isLast, isLast);
+                QCOMPARE(o.relayPath, QStringLiteral("relay/x"));
+                QCOMPARE(o.statusText, reader == Query ? status : QString());
+                QCOMPARE(o.result.isValid(), o.ok);
+                if (o.ok)
+                    QCOMPARE(o.result.toList().size(), items.at(reader));
+            }
         }
     }
 
-    void unparseableReplies_data()
+    void readerResults()
     {
-        QTest::addColumn<QString>("replyText");
-        QTest::newRow("empty") << QString();
-        QTest::newRow("not xml") << "this is not xml";
-        QTest::newRow("truncated") << "<QryAlarmListRes><Alarm>";
-        QTest::newRow("two roots") << "<A/><B/>";
-    }
-
-    void unparseableReplies()
-    {
-        QFETCH(QString, replyText);
-        FakeTunnelClient tunnel;
-        ORVOSrvTunnelControl control(&tunnel);
-        Outcome query, process, info;
-        control.queryAlarm(client, QVariant(), recordQuery(query));
-        tunnel.reply({true, "r", "0", replyText, false});
-        control.processAlarm(client, {}, recordReply(process));
-        tunnel.reply({true, "r", "0", replyText, false});
-        control.getAlarmInfo(client, "1", "r", recordReply(info));
-        tunnel.reply({true, "r", "0", replyText, false});
-        for (const Outcome* o : {&query, &process, &info}) {
-            QCOMPARE(o->calls, 1);
-            QVERIFY(!o->ok);
-            QVERIFY(!o->result.isValid());
-            QCOMPARE(o->relayPath, QStringLiteral("r"));
-        }
-        QCOMPARE(query.statusText, QStringLiteral("0"));
-    }
-
-    void structurallyEmptyReplies_data()
-    {
-        QTest::addColumn<QString>("replyText");
-        QTest::newRow("other root") << "<Unexpected><Alarm/><Result/></Unexpected>";
-        QTest::newRow("empty roots") << "<QryAlarmListRes/>";
-        QTest::newRow("info without change log")
-            << "<GetAlarmInfoRes><Alarm><AlarmID>1</AlarmID></Alarm></GetAlarmInfoRes>";
-    }
-
-    void structurallyEmptyReplies()
-    {
-        QFETCH(QString, replyText);
-        Outcome query, process, info;
-        ORVOSrvTunnelControl::queryAlarmCB(true, "r", "0", replyText, true, recordQuery(query));
-        ORVOSrvTunnelControl::processAlarmCB(true, "r", "0", replyText, true, recordReply(process));
-        ORVOSrvTunnelControl::getAlarmInfoCB(true, "r", "0", replyText, true, recordReply(info));
-        for (const Outcome* o : {&query, &process, &info}) {
-            QVERIFY(o->ok);
-            QCOMPARE(o->result.typeId(), QMetaType::QVariantList);
-            QCOMPARE(o->result.toList(), QVariantList());
-        }
-    }
-
-    void alarmsPairedWithTheirXml()
-    {
-        Outcome out;
-        ORVOSrvTunnelControl::queryAlarmCB(true, "r", "0", threeAlarms, true, recordQuery(out));
-        QVERIFY(out.ok);
-        const QVariantList alarms = out.result.toList();
+        const QVariantList alarms = readAlarmList(threeAlarms).result.toList();
         QCOMPARE(alarms.size(), 3);
         QCOMPARE(
             alarms.at(0).toMap(),
             (QVariantMap{{"AlarmID", "1"},
                          {"XML", "    <Alarm>\n        <AlarmID>1</AlarmID>\n    </Alarm>\n"}}));
         // The alarm's own "XML" child is replaced by its text.
-        QCOMPARE(alarms.at(1).toMap().value("XML").toString(),
-                 QStringLiteral("    <Alarm>\n        <AlarmID>2</AlarmID>\n"
-                                "        <XML>own</XML>\n    </Alarm>\n"));
-        QCOMPARE(alarms.at(1).toMap().value("AlarmID").toString(), QStringLiteral("2"));
+        QCOMPARE(alarms.at(1).toMap(),
+                 (QVariantMap{{"AlarmID", "2"},
+                              {"XML", "    <Alarm>\n        <AlarmID>2</AlarmID>\n"
+                                      "        <XML>own</XML>\n    </Alarm>\n"}}));
         QCOMPARE(alarms.at(2).toMap(),
                  (QVariantMap{{"@ID", "3"}, {"XML", "    <Alarm ID=\"3\"/>\n"}}));
 
-        Outcome single;
-        ORVOSrvTunnelControl::queryAlarmCB(
-            true, "r", "0", "<QryAlarmListRes><Alarm><A>x</A></Alarm></QryAlarmListRes>", false,
-            recordQuery(single));
-        QCOMPARE(single.result.toList().size(), 1);
-        QCOMPARE(single.result.toList().first().toMap().value("A").toString(), QStringLiteral("x"));
-    }
-
-    void processOutcomes()
-    {
-        Outcome out;
-        ORVOSrvTunnelControl::processAlarmCB(
-            true, "r", "0",
+        const QString results =
             "<ProcessAlarmRes><Result><AlarmID>7</AlarmID><Code>0</Code><Extra>x</Extra></Result>"
-            "<Result><AlarmID>8</AlarmID></Result></ProcessAlarmRes>",
-            true, recordReply(out));
-        QVERIFY(out.ok);
-        QCOMPARE(out.result.toList(),
+            "<Result><AlarmID>8</AlarmID></Result></ProcessAlarmRes>";
+        QCOMPARE(readReply(Reader::Process, {true, "", "0", results, true}).result.toList(),
                  (QVariantList{QVariantMap{{"alarmId", "7"}, {"updateResult", "0"}},
                                QVariantMap{{"alarmId", "8"}, {"updateResult", ""}}}));
-    }
 
-    void changeLogEntries()
-    {
-        Outcome out;
-        ORVOSrvTunnelControl::getAlarmInfoCB(
-            true, "r", "0",
-            "<GetAlarmInfoRes><Alarm><AlarmID>1</AlarmID><ChangeLogs>"
-            "<Entry><State>A</State></Entry><Entry><State>B</State><Note>n</Note></Entry>"
-            "<Entry/></ChangeLogs></Alarm></GetAlarmInfoRes>",
-            true, recordReply(out));
-        QVERIFY(out.ok);
-        QCOMPARE(out.result.toList(),
+        const QString changes = "<GetAlarmInfoRes><Alarm><AlarmID>1</AlarmID><ChangeLogs>"
+                                "<Entry><State>A</State></Entry><Entry><State>B</State><Note>n"
+                                "</Note></Entry><Entry/></ChangeLogs></Alarm></GetAlarmInfoRes>";
+        QCOMPARE(readReply(Reader::Info, {true, "", "0", changes, true}).result.toList(),
                  (QVariantList{QVariantMap{{"State", "A"}},
                                QVariantMap{{"State", "B"}, {"Note", "n"}}, QString()}));
-
-        Outcome single;
-        ORVOSrvTunnelControl::getAlarmInfoCB(
-            true, "r", "0",
-            "<GetAlarmInfoRes><Alarm><ChangeLogs><Entry><State>A</State></Entry></ChangeLogs>"
-            "</Alarm></GetAlarmInfoRes>",
-            true, recordReply(single));
-        QCOMPARE(single.result.toList(), (QVariantList{QVariantMap{{"State", "A"}}}));
-    }
-
-    // The tunnel may call a reply callback more than once, from any thread, even after the
-    // control that sent the request is gone.
-    void repeatedRepliesOnOtherThreadsAfterDestruction()
-    {
-        FakeTunnelClient tunnel;
-        std::atomic<int> calls{0};
-        std::atomic<int> alarms{0};
-        {
-            ORVOSrvTunnelControl control(&tunnel);
-            control.queryAlarm(
-                client, QVariant(),
-                [&](bool ok, bool, const QVariant& result, const QString&, const QString&) {
-                    ++calls;
-                    if (ok)
-                        alarms += result.toList().size();
-                });
-        }
-        const FakeTunnelClient::Record record = tunnel.last();
-        std::vector<std::thread> threads;
-        for (int i = 0; i < 4; ++i) {
-            threads.emplace_back([&] {
-                for (int j = 0; j < 25; ++j)
-                    FakeTunnelClient::deliver(record, {true, "r", "0", threeAlarms, j == 24});
-            });
-        }
-        for (std::thread& t : threads)
-            t.join();
-        QCOMPARE(calls.load(), 100);
-        QCOMPARE(alarms.load(), 300);
-    }
-
-    void replacedComposerIsUsed()
-    {
-        struct Fixed : MessageComposer
-        {
-            QString composeGetAlarmInfoMessage(const QString&) override { return "<Fixed/>"; }
-        };
-        FakeTunnelClient tunnel;
-        ORVOSrvTunnelControl control(&tunnel);
-        control.setMessageComposer(QSharedPointer<Fixed>::create());
-        Outcome out;
-        control.getAlarmInfo(client, "1", "r", recordReply(out));
-        QCOMPARE(tunnel.last().commandText, QStringLiteral("<Fixed/>"));
+        // A single entry is a list of one.
+        const QString single = "<GetAlarmInfoRes><Alarm><ChangeLogs><Entry><State>A</State>"
+                               "</Entry></ChangeLogs></Alarm></GetAlarmInfoRes>";
+        QCOMPARE(readReply(Reader::Info, {true, "", "0", single, true}).result.toList(),
+                 (QVariantList{QVariantMap{{"State", "A"}}}));
     }
 };
 

@@ -1,11 +1,12 @@
-#include "TraceRecorder.h"
+// Recording trace library that tests put in place of "libZoltLogUtl.dylib" (TraceRecorderClient.h
+// reads it). Registration gives the module id 42; TRACERECORDER_NO_REGISTER=1 leaves the
+// registration entry null.
 
 #include <ZoltLogUtl.h>
 
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <deque>
 #include <mutex>
 #include <set>
 #include <string>
@@ -14,17 +15,14 @@
 
 namespace {
 
-constexpr int32_t DefaultModuleId = 42;
-
-// Recorder state; a deque keeps the entries' text in place while new entries are added.
 struct Recorder
 {
     std::mutex mutex;
-    std::deque<std::string> journal;
+    std::string journal;
+    std::string copy; // what TraceRecorder_journal last handed out
     std::set<int64_t> refused;
     TraceGlobalObject object{};
     int contextTag = 0;
-    int32_t moduleId = DefaultModuleId;
 };
 
 Recorder& recorder()
@@ -33,24 +31,17 @@ Recorder& recorder()
     return instance;
 }
 
-bool envFlag(const char* name)
-{
-    const char* value = std::getenv(name);
-    return value && std::strcmp(value, "1") == 0;
-}
-
+// One journal line per call; a context other than the one handed out is appended to the line.
 void record(void* context, std::string entry)
 {
     Recorder& r = recorder();
     if (context != r.object.context) {
         char pointer[32];
-        std::snprintf(pointer, sizeof pointer, "%p", context);
-        entry += " [context ";
+        std::snprintf(pointer, sizeof pointer, " [context %p]", context);
         entry += pointer;
-        entry += ']';
     }
     std::lock_guard<std::mutex> lock(r.mutex);
-    r.journal.push_back(std::move(entry));
+    r.journal += entry + '\n';
 }
 
 void registerModule(void* context, int32_t kind, const char* moduleName, int32_t* moduleId)
@@ -58,7 +49,7 @@ void registerModule(void* context, int32_t kind, const char* moduleName, int32_t
     record(context,
            "register " + std::to_string(kind) + ' ' + (moduleName ? moduleName : "(null)"));
     if (moduleId)
-        *moduleId = recorder().moduleId;
+        *moduleId = 42;
 }
 
 int32_t checkLevel(void* context, int64_t levelCode, int64_t reserved, const char* file,
@@ -73,48 +64,37 @@ int32_t checkLevel(void* context, int64_t levelCode, int64_t reserved, const cha
 
 void output(void* context, const char* format, va_list args)
 {
-    va_list sizing;
-    va_copy(sizing, args);
-    const int size = std::vsnprintf(nullptr, 0, format, sizing);
-    va_end(sizing);
-    std::string text(static_cast<size_t>(size < 0 ? 0 : size), '\0');
-    std::vsnprintf(text.data(), text.size() + 1, format, args);
-    record(context, "out " + text);
+    char text[1024];
+    std::vsnprintf(text, sizeof text, format, args);
+    record(context, std::string("out ") + text);
 }
 
 } // namespace
 
-TRACERECORDER_EXPORT int32_t LogTrace_GetGlobalObject(int32_t /*reserved*/,
-                                                      TraceGlobalObject** object)
+TRACERECORDER_EXPORT int32_t LogTrace_GetGlobalObject(int32_t, TraceGlobalObject** object)
 {
     Recorder& r = recorder();
+    const char* noRegister = std::getenv("TRACERECORDER_NO_REGISTER");
     r.object = TraceGlobalObject{};
-    r.object.context = envFlag("TRACERECORDER_NULL_CONTEXT") ? nullptr : &r.contextTag;
-    r.object.registerModule = envFlag("TRACERECORDER_NO_REGISTER") ? nullptr : registerModule;
+    r.object.context = &r.contextTag;
+    r.object.registerModule =
+        noRegister && !std::strcmp(noRegister, "1") ? nullptr : registerModule;
     r.object.checkLevel = checkLevel;
-    r.object.output = envFlag("TRACERECORDER_NO_OUTPUT") ? nullptr : output;
-    if (const char* id = std::getenv("TRACERECORDER_MODULE_ID"))
-        r.moduleId = static_cast<int32_t>(std::strtol(id, nullptr, 0));
+    r.object.output = output;
     *object = &r.object;
     return 0;
 }
 
-TRACERECORDER_EXPORT int32_t TraceRecorder_journalSize()
+// The journal, one entry a line; valid until the next call.
+TRACERECORDER_EXPORT const char* TraceRecorder_journal()
 {
     Recorder& r = recorder();
     std::lock_guard<std::mutex> lock(r.mutex);
-    return static_cast<int32_t>(r.journal.size());
+    r.copy = r.journal;
+    return r.copy.c_str();
 }
 
-TRACERECORDER_EXPORT const char* TraceRecorder_journalEntry(int32_t index)
-{
-    Recorder& r = recorder();
-    std::lock_guard<std::mutex> lock(r.mutex);
-    if (index < 0 || static_cast<size_t>(index) >= r.journal.size())
-        return nullptr;
-    return r.journal[static_cast<size_t>(index)].c_str();
-}
-
+// Empties the journal and forgets every refused level code.
 TRACERECORDER_EXPORT void TraceRecorder_reset()
 {
     Recorder& r = recorder();
@@ -123,6 +103,7 @@ TRACERECORDER_EXPORT void TraceRecorder_reset()
     r.refused.clear();
 }
 
+// Makes the level check answer 1 (do not write) for this level code.
 TRACERECORDER_EXPORT void TraceRecorder_refuse(int64_t levelCode)
 {
     Recorder& r = recorder();

@@ -1,25 +1,17 @@
 #pragma once
 
-#include "TraceRecorder.h"
-
 #include <QStringList>
 #include <QtGlobal>
 
 #include <dlfcn.h>
 
-// The recording library the glue has loaded, reached without linking it.
+// The recording library the glue has loaded, reached without linking it. Its journal holds one
+// entry per call: "register <kind> <module>", "check <level code> <reserved> <file>:<line>",
+// "out <line>".
 class TraceRecorderClient
 {
 public:
-    TraceRecorderClient() : m_handle(dlopen("libZoltLogUtl.dylib", RTLD_LAZY | RTLD_NOLOAD))
-    {
-        if (!m_handle)
-            return;
-        m_size = resolve<TraceRecorder_journalSizeFn>("TraceRecorder_journalSize");
-        m_entry = resolve<TraceRecorder_journalEntryFn>("TraceRecorder_journalEntry");
-        m_reset = resolve<TraceRecorder_resetFn>("TraceRecorder_reset");
-        m_refuse = resolve<TraceRecorder_refuseFn>("TraceRecorder_refuse");
-    }
+    TraceRecorderClient() : m_handle(dlopen("libZoltLogUtl.dylib", RTLD_LAZY | RTLD_NOLOAD)) {}
     ~TraceRecorderClient()
     {
         if (m_handle)
@@ -27,38 +19,38 @@ public:
     }
     Q_DISABLE_COPY_MOVE(TraceRecorderClient)
 
-    bool isLoaded() const { return m_handle != nullptr; }
-
+    bool isLoaded() const { return m_handle; }
     QStringList journal() const
     {
-        QStringList entries;
-        for (int32_t i = 0; m_handle && i < m_size(); ++i)
-            entries << QString::fromUtf8(m_entry(i));
-        return entries;
+        return m_handle ? QString::fromUtf8(call<const char* (*)()>("TraceRecorder_journal")())
+                              .split(QLatin1Char('\n'), Qt::SkipEmptyParts)
+                        : QStringList();
+    }
+    // The entries of one kind ("out ", "check "), without that prefix.
+    QStringList entries(const QString& kind = QStringLiteral("out ")) const
+    {
+        QStringList out;
+        for (const QString& entry : journal())
+            if (entry.startsWith(kind))
+                out << entry.mid(kind.size());
+        return out;
     }
     void reset() const
     {
         if (m_handle)
-            m_reset();
+            call<void (*)()>("TraceRecorder_reset")();
     }
     void refuse(qint64 levelCode) const
     {
         if (m_handle)
-            m_refuse(levelCode);
+            call<void (*)(int64_t)>("TraceRecorder_refuse")(levelCode);
     }
 
 private:
-    template <typename Fn> Fn resolve(const char* name) const
+    template <typename Fn> Fn call(const char* name) const
     {
-        auto fn = reinterpret_cast<Fn>(dlsym(m_handle, name));
-        if (!fn)
-            qFatal("recorder function %s missing", name);
-        return fn;
+        return reinterpret_cast<Fn>(dlsym(m_handle, name));
     }
 
     void* m_handle;
-    TraceRecorder_journalSizeFn m_size = nullptr;
-    TraceRecorder_journalEntryFn m_entry = nullptr;
-    TraceRecorder_resetFn m_reset = nullptr;
-    TraceRecorder_refuseFn m_refuse = nullptr;
 };
