@@ -84,7 +84,7 @@ private:
         // Written into a buffer that keeps its capacity from alarm to alarm; whether a line break
         // ends it is known once the text after the alarm has been read.
         m_xml.clear();
-        AlarmTextWriter(m_xml).write(m_subtree, 0, 1, afterText);
+        m_writer.write(m_subtree, 0, 1, afterText);
         m_alarmPending = true;
         m_subtree.clear();
     }
@@ -108,6 +108,7 @@ private:
     // The alarm read last, its text in m_xml still without its line break, while m_alarmPending.
     QVariantMap m_alarm;
     Utf16Buffer m_xml;
+    AlarmTextWriter m_writer{m_xml};
     bool m_alarmPending = false;
     qsizetype m_alarmChildren = 0;
 };
