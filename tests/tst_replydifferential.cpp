@@ -113,7 +113,8 @@ private slots:
                      "<M raw=\"l1\nl2\tl3\">2</M><K v=\"&lt;&gt;]]>&amp;\"/></Alarm>"));
         scanner("several attributes in hash order",
                 wrap("<Alarm a='1' b='2' c='3' d='4'><N x='1' y='2'/><M z1='1' z2='2' z3='3' "
-                     "z4='4' z5='5' z6='6'>t</M></Alarm><Alarm ID='2' Kind='x'/>"));
+                     "z4='4' z5='5' z6='6'>t</M></Alarm><Alarm ID='2' Kind='x'/><Alarm ID='2' "
+                     "Kind='x'/>"));
         scanner("white-space-only texts",
                 wrap("<Alarm><A>  \n\t </A><B>&#160;</B><C>" + QString(QChar(0x3000)) + "</C><D>" +
                      QString(QChar(0x85)) + "</D><E>" + QString(QChar(0x2028)) +
