@@ -95,6 +95,9 @@ private slots:
 
         scanner("generated 60 alarms", AlarmReplies::reply(60));
         scanner("one alarm, no white space", wrap(AlarmReplies::alarm(4)));
+        scanner("history reply", "<GetAlarmInfoRes><Alarm><AlarmID>A1</AlarmID><ChangeLogs><Entry>"
+                                 "<State>New</State></Entry><Entry><Note/></Entry></ChangeLogs>"
+                                 "</Alarm></GetAlarmInfoRes>");
         for (AlarmReplies::Shape shape : AlarmReplies::Shapes)
             scanner(AlarmReplies::shapeName(shape), AlarmReplies::shapedReply(shape, 8));
         scanner("distinct names, ranked as they come",
@@ -233,6 +236,12 @@ private slots:
         QCOMPARE(scanned.has_value(), route == Route::Scanner);
         QCOMPARE(general.has_value(), route != Route::Refused);
         QCOMPARE(AlarmXmlParser::readAlarmListReply(reply), general);
+        // The other readers' route: the same form read whole, rendered as XML2Json renders it.
+        const QVariant parsed = XML2Json().parse(reply);
+        const std::optional<QVariantMap> document = AlarmListScanner::readDocument(reply);
+        QCOMPARE(document.has_value(), route == Route::Scanner);
+        QCOMPARE(AlarmXmlParser::readReply(reply), document ? QVariant(*document) : parsed);
+        QCOMPARE(AlarmXmlParser::readReply(reply), parsed);
         if (!scanned)
             return;
 

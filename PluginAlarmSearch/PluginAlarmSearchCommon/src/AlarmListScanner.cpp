@@ -119,3 +119,21 @@ std::optional<QVariantList> AlarmListScanner::read(const QString& replyText)
 {
     return Scanner(replyText).run();
 }
+
+std::optional<QVariantMap> AlarmListScanner::readDocument(const QString& replyText)
+{
+    ReplyTokenizer tokens(replyText);
+    if (!tokens.declaration())
+        return std::nullopt;
+    tokens.skipSpace();
+    if (!tokens.at(u'<'))
+        return std::nullopt;
+    tokens.skip();
+    AlarmSubtree document;
+    if (!document.capture(tokens, 1, true))
+        return std::nullopt;
+    tokens.skipSpace();
+    if (!tokens.atEnd())
+        return std::nullopt;
+    return QVariantMap{{document.node(0).name.toString(), AlarmMapBuilder().render(document, 0)}};
+}
