@@ -3,6 +3,7 @@
 #include <AlarmSearchLimits.h>
 #include <XmlTextBounds.h>
 
+#include <QScopeGuard>
 #include <QXmlStreamReader>
 
 namespace AlarmServerSim {
@@ -47,7 +48,11 @@ std::optional<XmlElement> parseXmlDocument(const QString& text)
     // duplicates in quadratic time.
     if (!AlarmSearchLimits::withinTextBounds(text))
         return std::nullopt;
-    QXmlStreamReader reader(text);
+    // One reader per thread, cleared after each text: setting a reader up takes about as long as
+    // reading a short command with it.
+    thread_local QXmlStreamReader reader;
+    reader.addData(text);
+    const auto clear = qScopeGuard([] { reader.clear(); });
     XmlElement root;
     // Path from the document element down to the element being read.
     QList<XmlElement*> open;
