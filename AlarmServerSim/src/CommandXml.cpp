@@ -6,6 +6,8 @@
 #include <QScopeGuard>
 #include <QXmlStreamReader>
 
+#include <algorithm>
+
 namespace AlarmServerSim {
 
 const XmlElement* XmlElement::child(QStringView childName) const
@@ -100,7 +102,10 @@ void appendTextElement(QString& out, QLatin1String tag, const QString& value)
         return;
     }
     out += QLatin1Char('>');
-    out += value.toHtmlEscaped();
+    const bool plain = std::none_of(value.cbegin(), value.cend(), [](QChar c) {
+        return c == u'<' || c == u'>' || c == u'&' || c == u'"';
+    });
+    out += plain ? value : value.toHtmlEscaped(); // escaping copies the text even when it is plain
     out += QLatin1String("</");
     out += tag;
     out += QLatin1Char('>');
