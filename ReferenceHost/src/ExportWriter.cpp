@@ -22,10 +22,14 @@ const QStringList kTimeColumns{QStringLiteral("ServerTime"), QStringLiteral("Mut
 
 QStringList values(const QVariantMap& map, const QStringList& keys, const QTimeZone& zone)
 {
+    // In UTC the server's times are shown as they are.
+    const bool shiftTimes = zone.isValid() && zone != QTimeZone::utc();
     QStringList out;
+    out.reserve(keys.size());
     for (const QString& key : keys) {
-        const QString value = map.value(key).toString();
-        out.append(kTimeColumns.contains(key) ? TimeArgument::display(value, zone) : value);
+        QString value = map.value(key).toString();
+        out.append(shiftTimes && kTimeColumns.contains(key) ? TimeArgument::display(value, zone)
+                                                            : std::move(value));
     }
     return out;
 }
