@@ -12,11 +12,10 @@
 #include <PluginAlarmSearchCommon.h>
 
 #include <QDateTime>
-#include <QDeadlineTimer>
-#include <QMutex>
+#include <QThreadPool>
 #include <QWaitCondition>
 
-#include <memory>
+#include <atomic>
 #include <vector>
 
 using namespace PluginAlarmSearchCommon;
@@ -51,25 +50,20 @@ bool prepareSearch(Cli& cli, const QCommandLineParser& parser, QString* method, 
 
 // Fetches the change histories of the alarms of a search with a bounded number of requests in
 // flight, and hands each alarm on with its history in the search's order. The histories of a
-// page are fetched while the next page is searched for; at most two pages are held. Requests
-// are sent without a thread waiting for each: as one is answered, its callback sends the next.
+// page are fetched while the next page is searched for; at most two pages are held.
 class HistoryFetcher
 {
 public:
     using Writer = std::function<bool(const ExportedAlarm& exported, QString* errorMessage)>;
 
-    HistoryFetcher(Cli& cli, Writer write)
-        : m_cli(cli), m_write(std::move(write)), m_state(std::make_shared<State>())
+    HistoryFetcher(Cli& cli, Writer write) : m_cli(cli), m_write(std::move(write))
     {
+        m_pool.setMaxThreadCount(kHistoryRequestsInFlight);
     }
-    // Waits for the requests in flight, up to the time limit of one request.
     ~HistoryFetcher()
     {
-        QMutexLocker locker(&m_state->mutex);
-        m_state->stop = true;
-        QDeadlineTimer deadline(m_cli.timeoutMs());
-        while (m_state->inFlight > 0 && m_state->changed.wait(&m_state->mutex, deadline)) {
-        }
+        m_stop = true;
+        m_pool.waitForDone();
     }
 
     // Writes the alarms of the page started before, then starts fetching this page's histories.
@@ -78,15 +72,22 @@ public:
         if (!writePage(errorMessage))
             return false;
         m_page = alarms;
-        {
-            QMutexLocker locker(&m_state->mutex);
-            m_state->ids.clear();
-            for (const QVariant& alarm : alarms)
-                m_state->ids.append(alarm.toMap().value(QStringLiteral("AlarmID")).toString());
-            m_state->results = std::vector<Slot>(size_t(alarms.size()));
-            m_state->next = 0;
+        m_results = std::vector<Slot>(size_t(alarms.size()));
+        for (size_t i = 0; i < m_results.size(); ++i) {
+            const QString id =
+                alarms[qsizetype(i)].toMap().value(QStringLiteral("AlarmID")).toString();
+            m_pool.start([this, i, id] {
+                Slot result;
+                if (!m_stop)
+                    result.ok = fetch(id, &result.history, &result.error);
+                QMutexLocker locker(&m_mutex);
+                m_results[i] = std::move(result);
+                m_results[i].done = true;
+                // The writer waits for one alarm at a time; the others it finds done.
+                if (i == m_awaited)
+                    m_done.wakeOne();
+            });
         }
-        sendMore(m_state, m_cli.session(), m_cli.timeoutMs());
         return true;
     }
 
@@ -94,46 +95,29 @@ public:
     bool writePage(QString* errorMessage)
     {
         bool ok = true;
-        for (qsizetype i = 0; ok && i < m_page.size(); ++i) {
+        for (size_t i = 0; ok && i < m_results.size(); ++i) {
             Slot slot;
             {
-                QMutexLocker locker(&m_state->mutex);
-                m_state->awaited = i;
-                QDeadlineTimer deadline(m_cli.timeoutMs());
-                while (!m_state->results[size_t(i)].done &&
-                       m_state->changed.wait(&m_state->mutex, deadline)) {
-                }
-                slot = std::move(m_state->results[size_t(i)]);
-                m_state->stop = m_state->stop || !slot.done;
+                QMutexLocker locker(&m_mutex);
+                m_awaited = i;
+                while (!m_results[i].done)
+                    m_done.wait(&m_mutex);
+                slot = std::move(m_results[i]);
             }
-            const QString id = m_page[i].toMap().value(QStringLiteral("AlarmID")).toString();
             if (interrupted()) {
                 *errorMessage = QStringLiteral("interrupted");
-                ok = false;
-            } else if (!slot.done) {
-                *errorMessage = QStringLiteral("no answer to %1 within %2 s (alarm %3)")
-                                    .arg(METHOD_GET_ALARM_HISTORY_FOR_EXPORT)
-                                    .arg(m_cli.timeoutMs() / 1000.0)
-                                    .arg(id);
                 ok = false;
             } else if (!slot.ok) {
                 *errorMessage = slot.error;
                 ok = false;
-            } else if (slot.answer.resultCode != QLatin1String("0")) {
-                *errorMessage =
-                    QStringLiteral("%1 (alarm %2)")
-                        .arg(m_cli.answerError(METHOD_GET_ALARM_HISTORY_FOR_EXPORT, slot.answer),
-                             id);
-                ok = false;
             } else {
-                ok = m_write(ExportedAlarm{m_page[i].toMap(), slot.answer.result.toList()},
+                ok = m_write(ExportedAlarm{m_page[qsizetype(i)].toMap(), slot.history},
                              errorMessage);
             }
         }
-        if (!ok) {
-            QMutexLocker locker(&m_state->mutex);
-            m_state->stop = true;
-        }
+        m_stop = !ok;
+        m_pool.waitForDone();
+        m_results.clear();
         m_page.clear();
         return ok;
     }
@@ -143,65 +127,37 @@ private:
     {
         bool done = false;
         bool ok = false;
-        PluginAnswer answer; // the last one
+        QVariantList history;
         QString error;
     };
 
-    // What the requests' callbacks share with the writer; they keep it alive past a time-out.
-    struct State
+    bool fetch(const QString& id, QVariantList* history, QString* errorMessage)
     {
-        QMutex mutex;
-        QWaitCondition changed; // a slot the writer waits for is done, or the last one in flight
-        QStringList ids;        // of the page being fetched
-        std::vector<Slot> results;
-        qsizetype next = 0; // the next id to send a request for
-        int inFlight = 0;
-        qsizetype awaited = 0; // the slot writePage waits for
-        bool stop = false;
-    };
-
-    // Sends requests for the page's next ids while fewer than kHistoryRequestsInFlight are out.
-    static void sendMore(const std::shared_ptr<State>& state, ClientSession& session, int timeoutMs)
-    {
-        for (;;) {
-            qsizetype i = 0;
-            QString id;
-            {
-                QMutexLocker locker(&state->mutex);
-                if (state->stop || state->inFlight == kHistoryRequestsInFlight ||
-                    state->next == state->ids.size())
-                    return;
-                i = state->next++;
-                id = state->ids[i];
-                ++state->inFlight;
-            }
-            session.callAsync(
-                METHOD_GET_ALARM_HISTORY_FOR_EXPORT, QVariantMap{{ARG_ALARM_ID, id}}, timeoutMs,
-                [state, &session, timeoutMs, i](bool ok, const QList<PluginAnswer>& answers,
-                                                const QString& error) {
-                    {
-                        QMutexLocker locker(&state->mutex);
-                        Slot& slot = state->results[size_t(i)];
-                        slot.done = true;
-                        slot.ok = ok && !answers.isEmpty();
-                        slot.answer = answers.isEmpty() ? PluginAnswer() : answers.constLast();
-                        slot.error = error;
-                        // A failed request ends the export: no more are sent.
-                        state->stop =
-                            state->stop || !slot.ok || slot.answer.resultCode != QLatin1String("0");
-                        --state->inFlight;
-                        if (i == state->awaited || state->inFlight == 0)
-                            state->changed.wakeAll();
-                    }
-                    sendMore(state, session, timeoutMs);
-                });
+        QList<PluginAnswer> answers;
+        if (!m_cli.session().call(METHOD_GET_ALARM_HISTORY_FOR_EXPORT,
+                                  QVariantMap{{ARG_ALARM_ID, id}}, m_cli.timeoutMs(), &answers,
+                                  errorMessage))
+            return false;
+        if (answers.constLast().resultCode != QLatin1String("0")) {
+            *errorMessage = QStringLiteral("%1 (alarm %2)")
+                                .arg(m_cli.answerError(METHOD_GET_ALARM_HISTORY_FOR_EXPORT,
+                                                       answers.constLast()),
+                                     id);
+            return false;
         }
+        *history = answers.constLast().result.toList();
+        return true;
     }
 
     Cli& m_cli;
     Writer m_write;
     QVariantList m_page;
-    std::shared_ptr<State> m_state;
+    std::vector<Slot> m_results;
+    size_t m_awaited = 0; // the slot writePage waits for, under m_mutex
+    std::atomic<bool> m_stop{false};
+    QMutex m_mutex;
+    QWaitCondition m_done;
+    QThreadPool m_pool; // last: destroyed first, once its tasks are done with the members above
 };
 
 } // namespace

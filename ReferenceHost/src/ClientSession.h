@@ -4,10 +4,7 @@
 
 #include <QList>
 #include <QString>
-#include <QThreadPool>
 #include <QVariant>
-
-#include <functional>
 
 // One answer of a plug-in to a request, as its request callback delivered it.
 struct PluginAnswer
@@ -30,21 +27,6 @@ public:
     // when no last answer came within timeoutMs, or the request could not be made.
     virtual bool call(const QString& method, const QVariant& args, int timeoutMs,
                       QList<PluginAnswer>* answers, QString* errorMessage) = 0;
-    // What callAsync hands on: the answers up to the last one, or false and why there are none.
-    using AnswerHandler = std::function<void(bool ok, const QList<PluginAnswer>& answers,
-                                             const QString& errorMessage)>;
-    // Sends a request and returns at once; done is called once, on another thread (or on this
-    // one when the request could not be made). By default call runs on Qt's global thread pool.
-    virtual void callAsync(const QString& method, const QVariant& args, int timeoutMs,
-                           AnswerHandler done)
-    {
-        QThreadPool::globalInstance()->start([this, method, args, timeoutMs, done] {
-            QList<PluginAnswer> answers;
-            QString error;
-            const bool ok = call(method, args, timeoutMs, &answers, &error);
-            done(ok, answers, error);
-        });
-    }
     // Sends a request that gets no answer ("MuteAlarm").
     virtual void send(const QString& method, const QVariant& args) = 0;
     // Waits until what send handed on has been carried out; false on timeout or failure.

@@ -77,21 +77,6 @@ bool HostSession::call(const QString& method, const QVariant& args, int timeoutM
     return true;
 }
 
-// Without a thread of its own waiting: the plug-in answers every request it takes, if need be
-// when the tunnel's own time limit runs out, so the caller bounds its wait by itself.
-void HostSession::callAsync(const QString& method, const QVariant& args, int /*timeoutMs*/,
-                            AnswerHandler done)
-{
-    auto answers = std::make_shared<QList<PluginAnswer>>();
-    m_plugin.Request(method, args, m_sender,
-                     [answers, done](bool isLast, const QString& resultCode, const QString& message,
-                                     const QVariant& result) {
-                         answers->append(PluginAnswer{isLast, resultCode, message, result});
-                         if (isLast)
-                             done(true, *answers, QString());
-                     });
-}
-
 void HostSession::send(const QString& method, const QVariant& args)
 {
     m_plugin.Request(method, args, m_sender,

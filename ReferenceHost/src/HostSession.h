@@ -27,8 +27,6 @@ public:
 
     bool call(const QString& method, const QVariant& args, int timeoutMs,
               QList<PluginAnswer>* answers, QString* errorMessage) override;
-    void callAsync(const QString& method, const QVariant& args, int timeoutMs,
-                   AnswerHandler done) override;
     void send(const QString& method, const QVariant& args) override;
     bool waitForIdle(int timeoutMs) override;
     bool subscribe(const QString& subscriptionKey, const QString& eventName,
