@@ -95,6 +95,9 @@ private slots:
 
         scanner("generated 60 alarms", AlarmReplies::reply(60));
         scanner("one alarm, no white space", wrap(AlarmReplies::alarm(4)));
+        scanner("history reply", "<GetAlarmInfoRes><Alarm><AlarmID>A1</AlarmID><ChangeLogs><Entry>"
+                                 "<State>New</State></Entry><Entry><Note/></Entry></ChangeLogs>"
+                                 "</Alarm></GetAlarmInfoRes>");
         for (AlarmReplies::Shape shape : AlarmReplies::Shapes)
             scanner(AlarmReplies::shapeName(shape), AlarmReplies::shapedReply(shape, 8));
         scanner("distinct names, ranked as they come",
@@ -113,7 +116,8 @@ private slots:
                      "<M raw=\"l1\nl2\tl3\">2</M><K v=\"&lt;&gt;]]>&amp;\"/></Alarm>"));
         scanner("several attributes in hash order",
                 wrap("<Alarm a='1' b='2' c='3' d='4'><N x='1' y='2'/><M z1='1' z2='2' z3='3' "
-                     "z4='4' z5='5' z6='6'>t</M></Alarm><Alarm ID='2' Kind='x'/>"));
+                     "z4='4' z5='5' z6='6'>t</M></Alarm><Alarm ID='2' Kind='x'/><Alarm ID='2' "
+                     "Kind='x'/>"));
         scanner("white-space-only texts",
                 wrap("<Alarm><A>  \n\t </A><B>&#160;</B><C>" + QString(QChar(0x3000)) + "</C><D>" +
                      QString(QChar(0x85)) + "</D><E>" + QString(QChar(0x2028)) +
@@ -232,6 +236,12 @@ private slots:
         QCOMPARE(scanned.has_value(), route == Route::Scanner);
         QCOMPARE(general.has_value(), route != Route::Refused);
         QCOMPARE(AlarmXmlParser::readAlarmListReply(reply), general);
+        // The other readers' route: the same form read whole, rendered as XML2Json renders it.
+        const QVariant parsed = XML2Json().parse(reply);
+        const std::optional<QVariantMap> document = AlarmListScanner::readDocument(reply);
+        QCOMPARE(document.has_value(), route == Route::Scanner);
+        QCOMPARE(AlarmXmlParser::readReply(reply), document ? QVariant(*document) : parsed);
+        QCOMPARE(AlarmXmlParser::readReply(reply), parsed);
         if (!scanned)
             return;
 

@@ -3,7 +3,10 @@
 #include <AlarmSearchLimits.h>
 #include <XmlTextBounds.h>
 
+#include <QScopeGuard>
 #include <QXmlStreamReader>
+
+#include <algorithm>
 
 namespace AlarmServerSim {
 
@@ -47,7 +50,11 @@ std::optional<XmlElement> parseXmlDocument(const QString& text)
     // duplicates in quadratic time.
     if (!AlarmSearchLimits::withinTextBounds(text))
         return std::nullopt;
-    QXmlStreamReader reader(text);
+    // One reader per thread, cleared after each text: setting a reader up takes about as long as
+    // reading a short command with it.
+    thread_local QXmlStreamReader reader;
+    reader.addData(text);
+    const auto clear = qScopeGuard([] { reader.clear(); });
     XmlElement root;
     // Path from the document element down to the element being read.
     QList<XmlElement*> open;
@@ -95,7 +102,10 @@ void appendTextElement(QString& out, const QString& tag, const QString& value)
         return;
     }
     out += QLatin1Char('>');
-    out += value.toHtmlEscaped();
+    const bool plain = std::none_of(value.cbegin(), value.cend(), [](QChar c) {
+        return c == u'<' || c == u'>' || c == u'&' || c == u'"';
+    });
+    out += plain ? value : value.toHtmlEscaped(); // escaping copies the text even when it is plain
     out += QLatin1String("</");
     out += tag;
     out += QLatin1Char('>');

@@ -23,8 +23,25 @@ std::optional<qint64> parseAlarmId(const QString& id)
 
 QString formatTime(qint64 secondsSinceEpoch)
 {
-    return QDateTime::fromSecsSinceEpoch(secondsSinceEpoch, QTimeZone::utc())
-        .toString(QStringLiteral("yyyy-MM-ddTHH:mm:ss'Z'"));
+    const QDateTime time = QDateTime::fromSecsSinceEpoch(secondsSinceEpoch, QTimeZone::utc());
+    const QDate date = time.date();
+    const QTime clock = time.time();
+    if (!time.isValid() || date.year() < 1 || date.year() > 9999)
+        return time.toString(QStringLiteral("yyyy-MM-ddTHH:mm:ss'Z'"));
+    // Written digit by digit: an export formats a few times per alarm, and a format string is
+    // read anew on each use.
+    char text[] = "0000-00-00T00:00:00Z";
+    const auto put = [&text](int at, int value, int digits) {
+        for (int i = digits - 1; i >= 0; --i, value /= 10)
+            text[at + i] = char('0' + value % 10);
+    };
+    put(0, date.year(), 4);
+    put(5, date.month(), 2);
+    put(8, date.day(), 2);
+    put(11, clock.hour(), 2);
+    put(14, clock.minute(), 2);
+    put(17, clock.second(), 2);
+    return QString::fromLatin1(text, sizeof(text) - 1);
 }
 
 std::optional<qint64> parseTime(const QString& text, int offsetSeconds)

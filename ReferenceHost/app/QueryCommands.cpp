@@ -84,7 +84,9 @@ public:
                 QMutexLocker locker(&m_mutex);
                 m_results[i] = std::move(result);
                 m_results[i].done = true;
-                m_done.wakeAll();
+                // The writer waits for one alarm at a time; the others it finds done.
+                if (i == m_awaited)
+                    m_done.wakeOne();
             });
         }
         return true;
@@ -98,6 +100,7 @@ public:
             Slot slot;
             {
                 QMutexLocker locker(&m_mutex);
+                m_awaited = i;
                 while (!m_results[i].done)
                     m_done.wait(&m_mutex);
                 slot = std::move(m_results[i]);
@@ -151,6 +154,7 @@ private:
     Writer m_write;
     QVariantList m_page;
     std::vector<Slot> m_results;
+    size_t m_awaited = 0; // the slot writePage waits for, under m_mutex
     std::atomic<bool> m_stop{false};
     QMutex m_mutex;
     QWaitCondition m_done;

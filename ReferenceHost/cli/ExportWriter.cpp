@@ -20,10 +20,14 @@ const QStringList kTimeColumns{FIELD_SERVER_TIME, FIELD_MUTE_UNTIL, FIELD_TIME};
 
 QStringList values(const QVariantMap& map, const QStringList& keys, const QTimeZone& zone)
 {
+    // In UTC the server's times are shown as they are.
+    const bool shiftTimes = zone.isValid() && zone != QTimeZone::utc();
     QStringList out;
+    out.reserve(keys.size());
     for (const QString& key : keys) {
-        const QString value = map.value(key).toString();
-        out.append(kTimeColumns.contains(key) ? TimeArgument::display(value, zone) : value);
+        QString value = map.value(key).toString();
+        out.append(shiftTimes && kTimeColumns.contains(key) ? TimeArgument::display(value, zone)
+                                                            : std::move(value));
     }
     return out;
 }
@@ -72,18 +76,24 @@ QByteArray ExportWriter::alarm(const ExportedAlarm& exported)
                AnswerFormat::jsonText(object, m_options.pretty, 4);
     }
     ++m_written;
-    const QStringList alarmFields = values(exported.alarm, ALARM_FIELDS, m_options.zone);
-    QList<QStringList> rows;
-    for (const QVariant& entry : exported.history)
-        rows.append(alarmFields + values(entry.toMap(), kEntryColumns, m_options.zone));
-    if (rows.isEmpty())
-        rows.append(alarmFields + QStringList(kEntryColumns.size()));
+    // The alarm's cells open each of its rows: written once.
+    QString alarmCells;
+    for (const QString& value : values(exported.alarm, ALARM_FIELDS, m_options.zone))
+        alarmCells.append(csvField(value, m_options.raw)).append(QLatin1Char(','));
     QString csv;
-    for (const QStringList& row : std::as_const(rows)) {
-        for (qsizetype i = 0; i < row.size(); ++i)
-            csv += (i > 0 ? QStringLiteral(",") : QString()) + csvField(row[i], m_options.raw);
+    const auto appendRow = [&](const QStringList& entryValues) {
+        csv += alarmCells;
+        for (qsizetype i = 0; i < entryValues.size(); ++i) {
+            if (i > 0)
+                csv += QLatin1Char(',');
+            csv += csvField(entryValues[i], m_options.raw);
+        }
         csv += QLatin1String("\r\n");
-    }
+    };
+    for (const QVariant& entry : exported.history)
+        appendRow(values(entry.toMap(), kEntryColumns, m_options.zone));
+    if (exported.history.isEmpty())
+        appendRow(QStringList(kEntryColumns.size()));
     return csv.toUtf8();
 }
 

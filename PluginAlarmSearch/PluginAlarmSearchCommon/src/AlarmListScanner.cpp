@@ -86,7 +86,7 @@ private:
         // Written into a buffer that keeps its capacity from alarm to alarm; whether a line break
         // ends it is known once the text after the alarm has been read.
         m_xml.clear();
-        AlarmTextWriter(m_xml).write(m_subtree, 0, 1, afterText);
+        m_writer.write(m_subtree, 0, 1, afterText);
         m_alarmPending = true;
         m_subtree.clear();
     }
@@ -110,6 +110,7 @@ private:
     // The alarm read last, its text in m_xml still without its line break, while m_alarmPending.
     QVariantMap m_alarm;
     Utf16Buffer m_xml;
+    AlarmTextWriter m_writer{m_xml};
     bool m_alarmPending = false;
     qsizetype m_alarmChildren = 0;
 };
@@ -119,4 +120,22 @@ private:
 std::optional<QVariantList> AlarmListScanner::read(const QString& replyText)
 {
     return Scanner(replyText).run();
+}
+
+std::optional<QVariantMap> AlarmListScanner::readDocument(const QString& replyText)
+{
+    ReplyTokenizer tokens(replyText);
+    if (!tokens.declaration())
+        return std::nullopt;
+    tokens.skipSpace();
+    if (!tokens.at(u'<'))
+        return std::nullopt;
+    tokens.skip();
+    AlarmSubtree document;
+    if (!document.capture(tokens, 1, true))
+        return std::nullopt;
+    tokens.skipSpace();
+    if (!tokens.atEnd())
+        return std::nullopt;
+    return QVariantMap{{document.node(0).name.toString(), AlarmMapBuilder().render(document, 0)}};
 }

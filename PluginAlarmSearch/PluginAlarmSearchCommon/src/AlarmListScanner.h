@@ -2,6 +2,7 @@
 
 #include <QString>
 #include <QVariantList>
+#include <QVariantMap>
 
 #include <optional>
 
@@ -23,4 +24,7 @@ class AlarmListScanner
 {
 public:
     static std::optional<QVariantList> read(const QString& replyText);
+    // Any reply of that form, whatever its document element, as XML2Json::parse gives it: the
+    // document element's name mapped to its rendering.
+    static std::optional<QVariantMap> readDocument(const QString& replyText);
 };

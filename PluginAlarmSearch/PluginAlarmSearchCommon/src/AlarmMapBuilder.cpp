@@ -37,13 +37,53 @@ QVariant AlarmMapBuilder::renderNode(const AlarmSubtree& subtree, qsizetype inde
         hasChildElements = hasChildElements || !subtree.node(child).isText();
     });
 
-    if (node.attributesBegin == node.attributesEnd && !hasChildElements) {
-        QString leaf;
-        for (qsizetype child = index + 1; child < node.end; ++child)
-            leaf += subtree.node(child).text;
-        return leaf.isNull() ? EmptyText : leaf;
-    }
+    if (hasChildElements)
+        return renderMap(subtree, index);
+    if (node.attributesBegin != node.attributesEnd)
+        return renderSharedLeaf(subtree, index);
+    QString leaf;
+    for (qsizetype child = index + 1; child < node.end; ++child)
+        leaf += subtree.node(child).text;
+    return leaf.isNull() ? EmptyText : leaf;
+}
 
+// Replies repeat elements of attributes and text from alarm to alarm (a state with its code, a
+// device with its kind and zone): each distinct one is rendered once and its map shared by the
+// alarms, as ReplyTokenizer shares repeated texts.
+QVariant AlarmMapBuilder::renderSharedLeaf(const AlarmSubtree& subtree, qsizetype index)
+{
+    // Up to this many distinct elements of up to SharedLeafLength characters of content are
+    // remembered.
+    constexpr qsizetype SharedLeaves = 1024;
+    constexpr qsizetype SharedLeafLength = 256;
+
+    // The content as one text: each attribute as name, NUL, value, NUL, then NUL and the text.
+    // Neither names nor values hold a NUL and names are never empty, so the text is unambiguous.
+    const SubtreeNode& node = subtree.node(index);
+    m_leafKey.resize(0); // keeps the capacity
+    for (qsizetype a = node.attributesBegin; a < node.attributesEnd; ++a) {
+        const ReplyAttribute& attribute = subtree.attribute(a);
+        m_leafKey.append(attribute.name).append(QChar(0)).append(attribute.value).append(QChar(0));
+    }
+    m_leafKey.append(QChar(0));
+    forEachChild(subtree, index, [&](qsizetype child) {
+        if (!subtree.node(child).xmlWhitespace)
+            m_leafKey.append(subtree.node(child).text);
+    });
+    if (m_leafKey.size() > SharedLeafLength)
+        return renderMap(subtree, index);
+    const auto it = m_sharedLeaves.constFind(m_leafKey);
+    if (it != m_sharedLeaves.cend())
+        return *it;
+    QVariant rendering = renderMap(subtree, index);
+    if (m_sharedLeaves.size() < SharedLeaves)
+        m_sharedLeaves.insert(m_leafKey, rendering);
+    return rendering;
+}
+
+QVariant AlarmMapBuilder::renderMap(const AlarmSubtree& subtree, qsizetype index)
+{
+    const SubtreeNode& node = subtree.node(index);
     // The entries in document order, then sorted by key so that each goes in at the map's end
     // without searching; repeated names stay in document order and become a list.
     QVarLengthArray<Entry, 32> entries;

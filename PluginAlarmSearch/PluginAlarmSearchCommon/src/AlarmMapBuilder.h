@@ -25,6 +25,8 @@ private:
     };
 
     QVariant renderNode(const AlarmSubtree& subtree, qsizetype index);
+    QVariant renderSharedLeaf(const AlarmSubtree& subtree, qsizetype index);
+    QVariant renderMap(const AlarmSubtree& subtree, qsizetype index);
     int keyId(QStringView name, QHash<QStringView, int>& cache, QStringView prefix);
     void rankNewKeys();
     bool keyLess(int a, int b) const;
@@ -37,4 +39,6 @@ private:
     std::vector<int> m_unrankedKeys;       // in the order they turned up
     QHash<QStringView, int> m_elementKeys; // keys view the reply text
     QHash<QStringView, int> m_attributeKeys;
+    QHash<QString, QVariant> m_sharedLeaves; // keyed by content, as renderSharedLeaf writes it
+    QString m_leafKey;                       // reused for each lookup
 };

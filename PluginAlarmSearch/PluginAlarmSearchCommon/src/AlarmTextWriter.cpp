@@ -36,8 +36,29 @@ void AlarmTextWriter::writeAttributes(const AlarmSubtree& subtree, const Subtree
     DomAttributeOrder::Names names;
     for (qsizetype a = node.attributesBegin; a < node.attributesEnd; ++a)
         names.append(subtree.attribute(a).name);
-    for (const qsizetype i : DomAttributeOrder::arrange(m_attributeOrder, names)) {
+    for (const qsizetype i : attributeOrder(names)) {
         const ReplyAttribute& attribute = subtree.attribute(node.attributesBegin + i);
         m_writer.attribute(attribute.name, attribute.value);
     }
+}
+
+const DomAttributeOrder::Positions&
+AlarmTextWriter::attributeOrder(const DomAttributeOrder::Names& names)
+{
+    // Up to this many lists are remembered; lists beyond them are arranged each time.
+    constexpr qsizetype RememberedOrders = 256;
+    if (names.size() < 2 || m_attributeOrder != DomAttributeOrder::Rule::Hash) {
+        m_uncachedOrder = DomAttributeOrder::arrange(m_attributeOrder, names);
+        return m_uncachedOrder;
+    }
+    m_ordersKey.resize(0); // keeps the capacity
+    for (const QStringView name : names)
+        m_ordersKey.append(name).append(u' ');
+    const auto it = m_orders.constFind(m_ordersKey);
+    if (it != m_orders.cend())
+        return *it;
+    m_uncachedOrder = DomAttributeOrder::arrange(m_attributeOrder, names);
+    if (m_orders.size() == RememberedOrders)
+        return m_uncachedOrder;
+    return *m_orders.insert(m_ordersKey, m_uncachedOrder);
 }

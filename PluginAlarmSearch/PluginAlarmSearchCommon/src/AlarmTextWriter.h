@@ -5,9 +5,12 @@
 #include "DomStyleWriter.h"
 #include "Utf16Buffer.h"
 
+#include <QHash>
+#include <QString>
+
 // Writes a captured element as XmlHelper::nodeToXml writes the DOM's element: indented and
 // escaped as QDomNode::save does, blank text dropped as the DOM drops it, attributes in the
-// DOM's order.
+// DOM's order. One writer serves a whole reply, so that the attribute orders found stay known.
 class AlarmTextWriter
 {
 public:
@@ -19,7 +22,14 @@ public:
 
 private:
     void writeAttributes(const AlarmSubtree& subtree, const SubtreeNode& node);
+    const DomAttributeOrder::Positions& attributeOrder(const DomAttributeOrder::Names& names);
 
     DomStyleWriter m_writer;
     const DomAttributeOrder::Rule m_attributeOrder = DomAttributeOrder::forDocumentOrder();
+    // The order of each list of attribute names met, keyed by the names joined with spaces.
+    // Replies repeat a few lists on every alarm, and under the hash rule each order costs a
+    // hash table of its own to find.
+    QHash<QString, DomAttributeOrder::Positions> m_orders;
+    QString m_ordersKey; // reused for each lookup
+    DomAttributeOrder::Positions m_uncachedOrder;
 };

@@ -77,3 +77,12 @@ std::optional<QVariantList> AlarmXmlParser::readAlarmListReplyGeneral(const QStr
     }
     return result;
 }
+
+QVariant AlarmXmlParser::readReply(const QString& replyText)
+{
+    if (replyText.size() <= MaxReplyLength) {
+        if (std::optional<QVariantMap> document = AlarmListScanner::readDocument(replyText))
+            return QVariant(std::move(*document));
+    }
+    return XML2Json().parse(replyText);
+}

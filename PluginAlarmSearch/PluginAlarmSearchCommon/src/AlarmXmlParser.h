@@ -2,6 +2,7 @@
 
 #include <QList>
 #include <QString>
+#include <QVariant>
 #include <QVariantList>
 
 #include <optional>
@@ -32,4 +33,8 @@ public:
     // The same result by the general route: XML2Json::parse and getAlarmList, paired by
     // position.
     static std::optional<QVariantList> readAlarmListReplyGeneral(const QString& replyText);
+
+    // Any other reply as XML2Json::parse renders it, invalid where XML2Json refuses the text:
+    // read in one pass by AlarmListScanner::readDocument where it has the common form.
+    static QVariant readReply(const QString& replyText);
 };

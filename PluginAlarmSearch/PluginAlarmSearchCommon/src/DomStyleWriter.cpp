@@ -92,8 +92,11 @@ void DomStyleWriter::escaped(QStringView value, bool encodeQuotes, bool attribut
 {
     qsizetype plainFrom = 0;
     for (qsizetype i = 0; i < value.size(); ++i) {
+        const char16_t c = value[i].unicode();
+        if (c > u'>') // past every character escaped below
+            continue;
         QStringView replacement;
-        switch (value[i].unicode()) {
+        switch (c) {
         case u'<':
             replacement = u"&lt;";
             break;

@@ -257,12 +257,13 @@ QString ReplyTokenizer::interned(QStringView text)
 {
     if (text.size() > InternedLength)
         return text.toString();
-    const auto it = m_texts.constFind(text);
+    const HashedView key{text, qHash(text)};
+    const auto it = m_texts.constFind(key);
     if (it != m_texts.cend())
         return *it;
     QString copy = text.toString();
     if (m_texts.size() < InternedTexts)
-        m_texts.insert(text, copy);
+        m_texts.insert(key, copy);
     return copy;
 }
 

@@ -69,7 +69,21 @@ private:
     bool endTag(QStringView elementName);
     QString interned(QStringView text);
 
+    // A text of the reply with its hash, so that a lookup compares the texts themselves (far
+    // apart in a long reply) only where the hashes agree.
+    struct HashedView
+    {
+        QStringView text;
+        size_t hash;
+
+        friend bool operator==(const HashedView& a, const HashedView& b)
+        {
+            return a.hash == b.hash && a.text == b.text;
+        }
+        friend size_t qHash(const HashedView& key, size_t) { return key.hash; }
+    };
+
     const char16_t* m_pos;
     const char16_t* const m_end;
-    QHash<QStringView, QString> m_texts; // keys view the reply text
+    QHash<HashedView, QString> m_texts; // keys view the reply text
 };

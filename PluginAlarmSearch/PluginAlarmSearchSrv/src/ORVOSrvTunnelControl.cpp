@@ -58,7 +58,7 @@ std::optional<QVariantMap> readReply(const char* readerName, const char* rejecte
 {
     if (!acceptReply(readerName, rejectedFormat, ok, statusText))
         return std::nullopt;
-    const QVariant parsed = XML2Json().parse(replyText);
+    const QVariant parsed = AlarmXmlParser::readReply(replyText);
     if (!parsed.isValid() || parsed.isNull()) {
         traceParseFailure(readerName, replyText);
         return std::nullopt;
