@@ -60,7 +60,7 @@ QVariant AlarmMapBuilder::renderNode(const AlarmSubtree& subtree, qsizetype inde
             text += childNode.text;
     });
     if (!text.isEmpty())
-        entries.append({0, std::move(text)}); // "#text" is the first key
+        entries.append({0, text}); // "#text" is the first key
 
     // Positions ordered by key, ties in document order: by rank where every key has one (the
     // common case, compared as numbers), else by the keys' texts.
@@ -95,7 +95,7 @@ QVariant AlarmMapBuilder::renderNode(const AlarmSubtree& subtree, qsizetype inde
             repeated.reserve(next - it);
             for (auto same = it; same != next; ++same)
                 repeated.append(std::move(entries[same->second].value));
-            value = std::move(repeated);
+            value = repeated;
         }
         content.emplace_hint(content.cend(), m_keys[std::size_t(key)], std::move(value));
         it = next;
