@@ -286,7 +286,7 @@ CommandReply AlarmServer::Private::processAlarm(QSqlDatabase db, const XmlElemen
 CommandReply AlarmServer::Private::getAlarmInfo(QSqlDatabase, const XmlElement& command,
                                                 const QString& /*user*/)
 {
-    const CommandReply unknownAlarm{kStatusUnknownAlarm, QString()};
+    CommandReply unknownAlarm{kStatusUnknownAlarm, QString()};
     const std::optional<qint64> number = parseAlarmId(command.childText(u"AlarmID"));
     if (!number)
         return unknownAlarm;

@@ -38,7 +38,7 @@ bool textOrList(const QJsonValue& value, QStringList* items, QString* error)
         *error = QStringLiteral("expected a text or a list of texts");
         return false;
     }
-    for (const QJsonValue& item : value.toArray()) {
+    for (const QJsonValue item : value.toArray()) {
         if (!item.isString()) {
             *error = QStringLiteral("expected a text or a list of texts");
             return false;
@@ -151,7 +151,7 @@ bool readRules(const QJsonValue& value, QVariant* out, QString* error)
     *error = QStringLiteral("expected a list of {\"type\": 0 or 1, \"tagList\": [texts]}");
     if (!value.isArray())
         return false;
-    for (const QJsonValue& rule : value.toArray()) {
+    for (const QJsonValue rule : value.toArray()) {
         const QJsonObject object = rule.toObject();
         const QJsonValue type = object.value(QLatin1String("type"));
         QStringList tags;
