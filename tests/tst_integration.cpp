@@ -170,7 +170,7 @@ private slots:
         QCOMPARE(ids(unhandled), expected);
 
         // A class with a sub-event; a whole class; names by folded substring; exact devices.
-        const QVariant sample = all[0];
+        const QVariant& sample = all[0];
         struct Case
         {
             QVariantMap args;

@@ -373,11 +373,12 @@ private slots:
                 [&](bool ok, bool, const QVariant& result, const QString&, const QString&) {
                     ++calls;
                     if (ok)
-                        alarms += result.toList().size();
+                        alarms += int(result.toList().size());
                 });
         }
         const FakeTunnelClient::Record record = tunnel.last();
         std::vector<std::thread> threads;
+        threads.reserve(4);
         for (int i = 0; i < 4; ++i) {
             threads.emplace_back([&] {
                 for (int j = 0; j < 25; ++j)

@@ -147,6 +147,7 @@ private slots:
             const int32_t ids[2] = {library.registerModule("ModuleA"),
                                     library.registerModule("ModuleB")};
             std::vector<std::thread> threads;
+            threads.reserve(Threads);
             for (int t = 0; t < Threads; ++t) {
                 threads.emplace_back([&library, &ids, t] {
                     for (int i = 0; i < LinesPerThread; ++i)
