@@ -126,7 +126,7 @@ void BM_AnswerFloor(benchmark::State& state)
         for (qsizetype i = 0; i < state.range(0); ++i) {
             QVariantMap alarm = model;
             alarm.insert(xmlKey, QString(xml.constData(), xml.size()));
-            answer.append(QVariant(std::move(alarm)));
+            answer.append(QVariant(alarm));
         }
         benchmark::DoNotOptimize(answer.size());
     }

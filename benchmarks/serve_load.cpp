@@ -48,7 +48,7 @@ QByteArray post(QNetworkAccessManager& network, const QString& path, const QJson
     QEventLoop loop;
     QObject::connect(reply, &QNetworkReply::finished, &loop, &QEventLoop::quit);
     loop.exec();
-    const QByteArray bytes = reply->readAll();
+    QByteArray bytes = reply->readAll();
     reply->deleteLater();
     return bytes;
 }
@@ -114,7 +114,7 @@ Throughput searchLoad(qint64 serverPid, int clients, const QJsonObject& body, do
     std::vector<std::unique_ptr<QNetworkAccessManager>> networks;
     QElapsedTimer clock;
     clock.start();
-    const qint64 endMs = qint64(seconds * 1000);
+    const auto endMs = qint64(seconds * 1000);
     QEventLoop loop;
     int running = clients;
     std::function<void(QNetworkAccessManager*)> ask = [&](QNetworkAccessManager* network) {

@@ -54,7 +54,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     if (size == 0)
         return 0;
     const char* const rest = reinterpret_cast<const char*>(data + 1);
-    const qsizetype restSize = qsizetype(size - 1);
+    const auto restSize = qsizetype(size - 1);
     if (data[0] % 2 == 1) {
         static const QString methods[] = {
             QStringLiteral("QryAlarmList"), QStringLiteral("ProcessAlarm"),

@@ -1,6 +1,6 @@
 #!/usr/bin/env bash
-# Installs the Debian packages the build, the tests, the benchmarks, the fuzz targets and the
-# Debian packages' making and checking need, and playwright-core for the browser tests (npm ci, at
+# Installs the Debian packages the build, the tests, the benchmarks, the fuzz targets, the lint
+# (scripts/lint.sh) and the Debian packages' making and checking need, and playwright-core for the browser tests (npm ci, at
 # the version package-lock.json pins).
 # Does nothing when all of them are present, so it is cheap to run before every build.
 set -euo pipefail
@@ -9,7 +9,7 @@ packages=(
     cmake ninja-build g++ pkg-config time
     qt6-base-dev libqt6sql6-sqlite qt6-httpserver-dev qt6-websockets-dev libutf8proc-dev
     libbenchmark-dev
-    clang libclang-rt-dev
+    clang libclang-rt-dev clang-format clang-tidy
     help2man dpkg-dev lintian
     chromium
 )

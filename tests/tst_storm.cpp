@@ -183,6 +183,7 @@ struct Storm
 template <typename Work> void onThreads(int count, Work work)
 {
     std::vector<std::thread> threads;
+    threads.reserve(count);
     for (int t = 0; t < count; ++t)
         threads.emplace_back(work, t);
     for (std::thread& thread : threads)

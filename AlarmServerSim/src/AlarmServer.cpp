@@ -293,7 +293,7 @@ CommandReply AlarmServer::Private::processAlarm(QSqlDatabase db, const XmlElemen
 CommandReply AlarmServer::Private::getAlarmInfo(QSqlDatabase, const XmlElement& command,
                                                 const QString& /*user*/)
 {
-    const CommandReply unknownAlarm{kStatusUnknownAlarm, QString()};
+    CommandReply unknownAlarm{kStatusUnknownAlarm, QString()};
     const std::optional<qint64> number = parseAlarmId(command.childText(FIELD_ALARM_ID));
     if (!number)
         return unknownAlarm;

@@ -85,7 +85,7 @@ private:
     {
         if (m_buffer.size() < qsizetype(sizeof(quint32)))
             return true;
-        const quint32 length = qFromBigEndian<quint32>(m_buffer.constData());
+        const auto length = qFromBigEndian<quint32>(m_buffer.constData());
         if (length <= TcpAlarmServer::MaxRequestPayload)
             return true;
         *error = QStringLiteral("request of %1 bytes exceeds the limit").arg(length);

@@ -30,7 +30,7 @@ bool takeFrames(QByteArray& buffer, QList<QJsonObject>& out, QString* error)
         valid = false;
     };
     while (buffer.size() - offset >= kHeaderSize) {
-        const quint32 length = qFromBigEndian<quint32>(buffer.constData() + offset);
+        const auto length = qFromBigEndian<quint32>(buffer.constData() + offset);
         if (length > kMaxFramePayload) {
             fail(QStringLiteral("frame of %1 bytes exceeds the limit").arg(length));
             break;

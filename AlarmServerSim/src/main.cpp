@@ -110,8 +110,9 @@ int main(int argc, char* argv[])
     bool connectionsOk = false;
     const int maxConnections = parser.value(maxConnectionsOption).toInt(&connectionsOk);
     if (!connectionsOk || maxConnections < 1)
-        return usageError(QStringLiteral("--max-connections needs a number of 1 or more, not \"%1\"")
-                              .arg(parser.value(maxConnectionsOption)));
+        return usageError(
+            QStringLiteral("--max-connections needs a number of 1 or more, not \"%1\"")
+                .arg(parser.value(maxConnectionsOption)));
     options.databasePath = parser.isSet(memoryOption) ? QStringLiteral(":memory:")
                            : parser.isSet(dbOption)
                                ? parser.value(dbOption)

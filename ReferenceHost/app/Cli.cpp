@@ -363,7 +363,7 @@ QString Cli::connectionError() const
 
 QString Cli::answerError(const QString& method, const PluginAnswer& answer)
 {
-    const QString lost = connectionError();
+    QString lost = connectionError();
     if (!lost.isEmpty())
         return lost;
     if (answer.resultCode.isEmpty())

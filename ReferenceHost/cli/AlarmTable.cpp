@@ -43,7 +43,7 @@ QString zoneLabel(const QTimeZone& zone)
 {
     if (zone == QTimeZone::utc())
         return QStringLiteral("UTC");
-    const QString id = QString::fromUtf8(zone.id());
+    QString id = QString::fromUtf8(zone.id());
     if (!id.startsWith(QLatin1String("UTC")))
         return id;
     const int offset = zone.offsetFromUtc(QDateTime::currentDateTimeUtc());

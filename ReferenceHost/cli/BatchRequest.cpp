@@ -38,7 +38,7 @@ bool textOrList(const QJsonValue& value, QStringList* items, QString* error)
         *error = QStringLiteral("expected a text or a list of texts");
         return false;
     }
-    for (const QJsonValue& item : value.toArray()) {
+    for (const QJsonValue item : value.toArray()) {
         if (!item.isString()) {
             *error = QStringLiteral("expected a text or a list of texts");
             return false;
@@ -155,7 +155,7 @@ bool readRules(const QJsonValue& value, QVariant* out, QString* error)
                  .arg(ARG_RULE_TAG_LIST);
     if (!value.isArray())
         return false;
-    for (const QJsonValue& rule : value.toArray()) {
+    for (const QJsonValue rule : value.toArray()) {
         const QJsonObject object = rule.toObject();
         const QJsonValue type = object.value(ARG_RULE_TYPE);
         QStringList tags;

@@ -9,6 +9,8 @@
 #include <QJsonArray>
 #include <QJsonDocument>
 
+#include <cmath>
+
 using namespace PluginAlarmSearchCommon;
 
 namespace ApiRequest {
@@ -207,7 +209,7 @@ bool mute(const QJsonObject& body, bool isMute, Mute* mute, FieldError* error)
     if (seconds.isUndefined())
         return fail(error, QStringLiteral("seconds"), QStringLiteral("is required"));
     const double value = seconds.toDouble(-1);
-    if (!seconds.isDouble() || value != qint64(value) || value < 1 || value > kMaxMuteSeconds)
+    if (!seconds.isDouble() || value < 1 || value > kMaxMuteSeconds || value != std::floor(value))
         return fail(error, QStringLiteral("seconds"),
                     QStringLiteral("must be a whole number from 1 to %1").arg(kMaxMuteSeconds));
     mute->seconds = int(value);

@@ -241,9 +241,10 @@ void ApiServer::addRoutes()
 #endif
         if (pattern.contains(QLatin1String("{alarmId}"))) {
             pattern.replace(QLatin1String("{alarmId}"), QLatin1String("<arg>"));
-            m_http->route(pattern, verb, [dispatch](QString alarmId, const QHttpServerRequest& r) {
-                return dispatch(r, QUrl::fromPercentEncoding(alarmId.toUtf8()));
-            });
+            m_http->route(pattern, verb,
+                          [dispatch](const QString& alarmId, const QHttpServerRequest& r) {
+                              return dispatch(r, QUrl::fromPercentEncoding(alarmId.toUtf8()));
+                          });
         } else {
             m_http->route(pattern, verb, [dispatch](const QHttpServerRequest& r) {
                 return dispatch(r, QString());
@@ -251,7 +252,7 @@ void ApiServer::addRoutes()
         }
     }
 
-    const auto notFound = [](const QHttpServerRequest& request, auto&& responder) {
+    const auto notFound = [](const QHttpServerRequest& request, QHttpServerResponder& responder) {
         qCInfo(lcServe).noquote() << request.url().path() << 404;
         QHttpServerResponse response(
             QByteArrayLiteral("application/json"),

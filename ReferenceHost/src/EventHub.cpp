@@ -8,7 +8,7 @@ int EventHub::addListener(const QString& subscriptionKey, Listener listener)
 {
     QMutexLocker locker(&m_mutex);
     const int id = m_nextId++;
-    m_listeners[subscriptionKey].insert(id, std::move(listener));
+    m_listeners[subscriptionKey].emplace(id, std::move(listener));
     m_keys.insert(id, subscriptionKey);
     return id;
 }

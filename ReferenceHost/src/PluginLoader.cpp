@@ -24,7 +24,7 @@ PluginLoader::~PluginLoader()
 
 QString PluginLoader::defaultPluginPath()
 {
-    const QString fromEnvironment = qEnvironmentVariable(kPluginEnvironmentVariable);
+    QString fromEnvironment = qEnvironmentVariable(kPluginEnvironmentVariable);
     if (!fromEnvironment.isEmpty())
         return fromEnvironment;
     return QCoreApplication::applicationDirPath() +

@@ -75,7 +75,7 @@ bool ReferenceHost::openTunnel(const Options& options, QString* errorMessage)
         return true;
     }
 
-    const int colon = options.serverAddress.lastIndexOf(QLatin1Char(':'));
+    const qsizetype colon = options.serverAddress.lastIndexOf(QLatin1Char(':'));
     bool portOk = false;
     const uint port = options.serverAddress.mid(colon + 1).toUInt(&portOk);
     const QString host =

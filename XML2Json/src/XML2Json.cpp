@@ -135,11 +135,11 @@ void XML2Json::addChild(QVariantMap& content, const QString& name, QVariant valu
 {
     const auto it = content.find(name);
     if (it == content.end()) {
-        content.insert(name, std::move(value));
+        content.insert(name, value);
     } else if (it->userType() == QMetaType::QVariantList) {
         static_cast<QVariantList*>(it->data())->append(std::move(value));
     } else {
         QVariantList repeated{std::move(*it), std::move(value)};
-        *it = std::move(repeated);
+        *it = repeated;
     }
 }

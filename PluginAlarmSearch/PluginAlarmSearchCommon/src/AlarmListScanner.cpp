@@ -97,7 +97,7 @@ private:
     {
         DomStyleWriter(m_xml).lineBreak(beforeText);
         m_alarm.insert(XmlKey, m_xml.view().toString());
-        m_alarms.append(QVariant(std::move(m_alarm)));
+        m_alarms.append(QVariant(m_alarm));
         m_alarm = QVariantMap();
         m_alarmPending = false;
     }

@@ -100,7 +100,7 @@ QVariant AlarmMapBuilder::renderMap(const AlarmSubtree& subtree, qsizetype index
             text += childNode.text;
     });
     if (!text.isEmpty())
-        entries.append({0, std::move(text)}); // "#text" is the first key
+        entries.append({0, text}); // "#text" is the first key
 
     // Positions ordered by key, ties in document order: by rank where every key has one (the
     // common case, compared as numbers), else by the keys' texts.
@@ -135,7 +135,7 @@ QVariant AlarmMapBuilder::renderMap(const AlarmSubtree& subtree, qsizetype index
             repeated.reserve(next - it);
             for (auto same = it; same != next; ++same)
                 repeated.append(std::move(entries[same->second].value));
-            value = std::move(repeated);
+            value = repeated;
         }
         content.emplace_hint(content.cend(), m_keys[std::size_t(key)], std::move(value));
         it = next;

@@ -28,7 +28,7 @@ bool AlarmSubtree::capture(ReplyTokenizer& tokens, int depth, bool keep)
         if (keep && !run.empty) {
             SubtreeNode node;
             node.text = std::move(run.value);
-            node.end = qsizetype(m_nodes.size() + 1);
+            node.end = qsizetype(m_nodes.size()) + 1;
             node.xmlWhitespace = run.xmlWhitespace;
             node.blank = run.blank;
             m_nodes.push_back(std::move(node));

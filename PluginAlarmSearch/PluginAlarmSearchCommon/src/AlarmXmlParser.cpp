@@ -73,7 +73,7 @@ std::optional<QVariantList> AlarmXmlParser::readAlarmListReplyGeneral(const QStr
     for (qsizetype i = 0; i < alarms.size(); ++i) {
         QVariantMap alarm = alarms.at(i).toMap();
         alarm.insert(xmlKey, i < alarmTexts.size() ? alarmTexts.at(i) : QString());
-        result.append(QVariant(std::move(alarm)));
+        result.append(QVariant(alarm));
     }
     return result;
 }

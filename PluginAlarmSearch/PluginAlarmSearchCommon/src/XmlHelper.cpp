@@ -162,7 +162,7 @@ bool XmlHelper::safeForDom(const QString& text, qsizetype maxLength, const Start
 }
 
 void XmlHelper::doSomeThingAllChildElement(const QDomElement& parent, const QString& tagName,
-                                           ElementAction action)
+                                           const ElementAction& action)
 {
     for (QDomElement child = parent.firstChildElement(tagName); !child.isNull();
          child = child.nextSiblingElement(tagName)) {

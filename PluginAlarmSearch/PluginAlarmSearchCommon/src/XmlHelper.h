@@ -26,7 +26,7 @@ public:
     // Calls action for each direct child element of parent named tagName (an empty name matches
     // every child element), in document order.
     static void doSomeThingAllChildElement(const QDomElement& parent, const QString& tagName,
-                                           ElementAction action);
+                                           const ElementAction& action);
 
     // The node and its subtree as XML text, exactly as QDomNode::save writes it with an indent
     // of 4. Elements, text, CDATA sections, comments and processing instructions are written

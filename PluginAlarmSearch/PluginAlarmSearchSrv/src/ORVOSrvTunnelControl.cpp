@@ -101,7 +101,7 @@ bool ORVOSrvTunnelControl::queryAlarm(void* clientID, const QVariant& args,
 
 void ORVOSrvTunnelControl::queryAlarmCB(bool ok, const QString& relayPath,
                                         const QString& statusText, const QString& replyText,
-                                        bool isLast, QueryAlarmCompletion completion)
+                                        bool isLast, const QueryAlarmCompletion& completion)
 {
     const char* const readerName = "queryAlarmCB";
     if (!acceptReply(readerName, "%s, QryAlarmList failed, %s", ok, statusText)) {
@@ -114,7 +114,7 @@ void ORVOSrvTunnelControl::queryAlarmCB(bool ok, const QString& relayPath,
         completion(false, isLast, QVariant(), statusText, relayPath);
         return;
     }
-    completion(true, isLast, QVariant(std::move(*alarms)), statusText, relayPath);
+    completion(true, isLast, QVariant(*alarms), statusText, relayPath);
 }
 
 bool ORVOSrvTunnelControl::processAlarm(void* clientID, const QMap<QString, QVariant>& args,
@@ -131,7 +131,7 @@ bool ORVOSrvTunnelControl::processAlarm(void* clientID, const QMap<QString, QVar
 
 void ORVOSrvTunnelControl::processAlarmCB(bool ok, const QString& relayPath,
                                           const QString& statusText, const QString& replyText,
-                                          bool isLast, ReplyCompletion completion)
+                                          bool isLast, const ReplyCompletion& completion)
 {
     const std::optional<QVariantMap> reply =
         readReply("processAlarmCB", "%s, processAlarm failed, %s", ok, statusText, replyText);
@@ -151,7 +151,7 @@ void ORVOSrvTunnelControl::processAlarmCB(bool ok, const QString& relayPath,
             {ARG_UPDATE_RESULT, fields.value(FIELD_CODE).toString()},
         });
     }
-    completion(true, isLast, QVariant(std::move(result)), relayPath);
+    completion(true, isLast, QVariant(result), relayPath);
 }
 
 bool ORVOSrvTunnelControl::getAlarmInfo(void* clientID, const QString& alarmId,
@@ -166,7 +166,7 @@ bool ORVOSrvTunnelControl::getAlarmInfo(void* clientID, const QString& alarmId,
 
 void ORVOSrvTunnelControl::getAlarmInfoCB(bool ok, const QString& relayPath,
                                           const QString& statusText, const QString& replyText,
-                                          bool isLast, ReplyCompletion completion)
+                                          bool isLast, const ReplyCompletion& completion)
 {
     const std::optional<QVariantMap> reply =
         readReply("getAlarmInfoCB", "%s, getAlarmInfo failed, %s", ok, statusText, replyText);

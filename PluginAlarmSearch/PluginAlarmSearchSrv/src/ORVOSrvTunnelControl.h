@@ -50,11 +50,13 @@ public:
     // Reply readers, reached through the reply callbacks the operations above hand over.
     static void queryAlarmCB(bool ok, const QString& relayPath, const QString& statusText,
                              const QString& replyText, bool isLast,
-                             QueryAlarmCompletion completion);
+                             const QueryAlarmCompletion& completion);
     static void processAlarmCB(bool ok, const QString& relayPath, const QString& statusText,
-                               const QString& replyText, bool isLast, ReplyCompletion completion);
+                               const QString& replyText, bool isLast,
+                               const ReplyCompletion& completion);
     static void getAlarmInfoCB(bool ok, const QString& relayPath, const QString& statusText,
-                               const QString& replyText, bool isLast, ReplyCompletion completion);
+                               const QString& replyText, bool isLast,
+                               const ReplyCompletion& completion);
 
 private:
     IOrvoTunnelClient* m_pTunnelClient;

@@ -17,8 +17,7 @@ void ignoreAnswer(bool, const QString&, const QString&, const QVariant&) {}
 
 thread_local const PluginLifeGuard::Visit* PluginLifeGuard::t_innermostVisit = nullptr;
 
-PluginLifeGuard::Visit::Visit(PluginLifeGuard& guard)
-    : m_guard(guard), m_plugin(nullptr), m_outer(t_innermostVisit)
+PluginLifeGuard::Visit::Visit(PluginLifeGuard& guard) : m_guard(guard), m_outer(t_innermostVisit)
 {
     std::lock_guard lock(m_guard.m_mutex);
     if (!m_guard.m_plugin)
@@ -89,12 +88,10 @@ void PluginAlarmSearchSrv::Request(const QString& method, const QVariant& args,
     Qt::HANDLE clientID = sender.clientHandle;
     if (method == METHOD_QUERY_UNHANDLED_ALARM || method == METHOD_QUERY_ALARM_LIST)
         handleQueryAlarm(clientID, args, reqCB);
-    else if (method == METHOD_GET_ALARM_HISTORY)
+    else if (method == METHOD_GET_ALARM_HISTORY || method == METHOD_GET_ALARM_HISTORY_FOR_EXPORT)
         handleGetAlarmHistory(clientID, args, reqCB);
     else if (method == METHOD_UPDATE_ALARM)
         handleUpdateAlarm(clientID, args, reqCB);
-    else if (method == METHOD_GET_ALARM_HISTORY_FOR_EXPORT)
-        handleGetAlarmHistory(clientID, args, reqCB);
     else if (method == METHOD_MUTE_ALARM)
         handleMuteAlarm(clientID, args);
     // Any other method is not ours: it is ignored without an answer.

@@ -48,7 +48,7 @@ private:
         friend class PluginLifeGuard;
 
         PluginLifeGuard& m_guard;
-        PluginAlarmSearchSrv* m_plugin;
+        PluginAlarmSearchSrv* m_plugin = nullptr;
         const Visit* m_outer;
     };
 
@@ -91,14 +91,15 @@ public:
 
     // "QryUnhandledAlarm" and "QryAlarmList".
     Q_INVOKABLE void handleQueryAlarm(Qt::HANDLE clientID, const QVariant& reqData,
-                                      HDLR_DO_REQUEST_CB reqCB);
+                                      const HDLR_DO_REQUEST_CB& reqCB);
     // "UpdateAlarm"; the reply is finished by handleProcessAlarm.
-    void handleUpdateAlarm(Qt::HANDLE clientID, const QVariant& reqData, HDLR_DO_REQUEST_CB reqCB);
+    void handleUpdateAlarm(Qt::HANDLE clientID, const QVariant& reqData,
+                           const HDLR_DO_REQUEST_CB& reqCB);
     void handleProcessAlarm(bool ok, bool isLast, const QVariant& result, const QVariant& reqData,
-                            HDLR_DO_REQUEST_CB reqCB);
+                            const HDLR_DO_REQUEST_CB& reqCB);
     // "GetAlarmHistory" and "GetAlarmHistoryForExport".
     void handleGetAlarmHistory(Qt::HANDLE clientID, const QVariant& reqData,
-                               HDLR_DO_REQUEST_CB reqCB);
+                               const HDLR_DO_REQUEST_CB& reqCB);
     // "MuteAlarm": sent without an answer.
     void handleMuteAlarm(Qt::HANDLE clientID, const QVariant& reqData);
 

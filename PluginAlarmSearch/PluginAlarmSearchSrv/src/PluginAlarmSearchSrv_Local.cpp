@@ -10,7 +10,8 @@
 using namespace PluginAlarmSearchCommon;
 
 void PluginAlarmSearchSrv::handleProcessAlarm(bool ok, bool isLast, const QVariant& result,
-                                              const QVariant& reqData, HDLR_DO_REQUEST_CB reqCB)
+                                              const QVariant& reqData,
+                                              const HDLR_DO_REQUEST_CB& reqCB)
 {
     const QVariantMap request = reqData.toMap();
     const QStringList alarmIds = request.value(ARG_ALARM_ID_LIST).toStringList();

@@ -19,7 +19,7 @@ void answerNotSent(const HDLR_DO_REQUEST_CB& reqCB)
 } // namespace
 
 void PluginAlarmSearchSrv::handleQueryAlarm(Qt::HANDLE clientID, const QVariant& reqData,
-                                            HDLR_DO_REQUEST_CB reqCB)
+                                            const HDLR_DO_REQUEST_CB& reqCB)
 {
     auto completion = [reqCB](bool /*ok*/, bool isLast, const QVariant& result,
                               const QString& statusText, const QString& relayPath) {
@@ -39,7 +39,7 @@ void PluginAlarmSearchSrv::handleQueryAlarm(Qt::HANDLE clientID, const QVariant&
 }
 
 void PluginAlarmSearchSrv::handleUpdateAlarm(Qt::HANDLE clientID, const QVariant& reqData,
-                                             HDLR_DO_REQUEST_CB reqCB)
+                                             const HDLR_DO_REQUEST_CB& reqCB)
 {
     const QVariantMap request = reqData.toMap();
     const QVariantMap processArgs{
@@ -69,7 +69,7 @@ void PluginAlarmSearchSrv::handleUpdateAlarm(Qt::HANDLE clientID, const QVariant
 }
 
 void PluginAlarmSearchSrv::handleGetAlarmHistory(Qt::HANDLE clientID, const QVariant& reqData,
-                                                 HDLR_DO_REQUEST_CB reqCB)
+                                                 const HDLR_DO_REQUEST_CB& reqCB)
 {
     const QVariantMap request = reqData.toMap();
     auto completion = [reqCB](bool ok, bool isLast, const QVariant& result,
