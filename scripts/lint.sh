@@ -54,5 +54,7 @@ if [ -n "$findings" ]; then
 elif [ -n "${tidyFailed:-}" ]; then
     cat "$log" "$errors" >&2
     status=1
+else
+    echo "clang-tidy: no findings in ${#units[@]} translation units" >&2
 fi
 exit $status
