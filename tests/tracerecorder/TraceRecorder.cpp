@@ -1,12 +1,12 @@
-// Recording trace library that tests put in place of "libZoltLogUtl.dylib" (TraceRecorderClient.h
-// reads it). Registration gives the module id 42; TRACERECORDER_NO_REGISTER=1 leaves the
+// Recording trace library that tests put in place of "libZoltLogUtl.dylib". Its journal holds one
+// entry a call: "register <kind> <module>", "check <level code> <reserved> <file>:<line>",
+// "out <line>". Registration gives the module id 42; TRACERECORDER_NO_REGISTER=1 leaves the
 // registration entry null.
 
 #include <ZoltLogUtl.h>
 
 #include <cstdio>
 #include <cstdlib>
-#include <cstring>
 #include <mutex>
 #include <set>
 #include <string>
@@ -31,17 +31,12 @@ Recorder& recorder()
     return instance;
 }
 
-// One journal line per call; a context other than the one handed out is appended to the line.
+// One journal line per call; a context other than the one handed out marks the line.
 void record(void* context, std::string entry)
 {
     Recorder& r = recorder();
-    if (context != r.object.context) {
-        char pointer[32];
-        std::snprintf(pointer, sizeof pointer, " [context %p]", context);
-        entry += pointer;
-    }
-    std::lock_guard<std::mutex> lock(r.mutex);
-    r.journal += entry + '\n';
+    const std::lock_guard<std::mutex> lock(r.mutex);
+    r.journal += entry + (context == &r.contextTag ? "\n" : " [foreign context]\n");
 }
 
 void registerModule(void* context, int32_t kind, const char* moduleName, int32_t* moduleId)
@@ -57,9 +52,8 @@ int32_t checkLevel(void* context, int64_t levelCode, int64_t reserved, const cha
 {
     record(context, "check " + std::to_string(levelCode) + ' ' + std::to_string(reserved) + ' ' +
                         (file ? file : "(null)") + ':' + std::to_string(line));
-    Recorder& r = recorder();
-    std::lock_guard<std::mutex> lock(r.mutex);
-    return r.refused.count(levelCode) ? 1 : 0;
+    const std::lock_guard<std::mutex> lock(recorder().mutex);
+    return recorder().refused.count(levelCode) ? 1 : 0;
 }
 
 void output(void* context, const char* format, va_list args)
@@ -75,10 +69,10 @@ TRACERECORDER_EXPORT int32_t LogTrace_GetGlobalObject(int32_t, TraceGlobalObject
 {
     Recorder& r = recorder();
     const char* noRegister = std::getenv("TRACERECORDER_NO_REGISTER");
+    const bool registers = !noRegister || std::string(noRegister) != "1";
     r.object = TraceGlobalObject{};
     r.object.context = &r.contextTag;
-    r.object.registerModule =
-        noRegister && !std::strcmp(noRegister, "1") ? nullptr : registerModule;
+    r.object.registerModule = registers ? registerModule : nullptr;
     r.object.checkLevel = checkLevel;
     r.object.output = output;
     *object = &r.object;
@@ -89,7 +83,7 @@ TRACERECORDER_EXPORT int32_t LogTrace_GetGlobalObject(int32_t, TraceGlobalObject
 TRACERECORDER_EXPORT const char* TraceRecorder_journal()
 {
     Recorder& r = recorder();
-    std::lock_guard<std::mutex> lock(r.mutex);
+    const std::lock_guard<std::mutex> lock(r.mutex);
     r.copy = r.journal;
     return r.copy.c_str();
 }
@@ -98,7 +92,7 @@ TRACERECORDER_EXPORT const char* TraceRecorder_journal()
 TRACERECORDER_EXPORT void TraceRecorder_reset()
 {
     Recorder& r = recorder();
-    std::lock_guard<std::mutex> lock(r.mutex);
+    const std::lock_guard<std::mutex> lock(r.mutex);
     r.journal.clear();
     r.refused.clear();
 }
@@ -106,7 +100,6 @@ TRACERECORDER_EXPORT void TraceRecorder_reset()
 // Makes the level check answer 1 (do not write) for this level code.
 TRACERECORDER_EXPORT void TraceRecorder_refuse(int64_t levelCode)
 {
-    Recorder& r = recorder();
-    std::lock_guard<std::mutex> lock(r.mutex);
-    r.refused.insert(levelCode);
+    const std::lock_guard<std::mutex> lock(recorder().mutex);
+    recorder().refused.insert(levelCode);
 }
