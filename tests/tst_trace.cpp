@@ -67,20 +67,6 @@ struct RecorderClient
 };
 const RecorderClient recorder; // constructed before the glue's tests change anything
 
-// The level code a check carries, as exact values for the module ids the tests hand out.
-qint64 levelCode(int moduleId, int level)
-{
-    switch (moduleId) {
-    case 0:
-        return level;
-    case 42: // what the recorder gives at registration
-        return 10752 + level;
-    case 0x800000: // reaches the sign bit of the 32-bit code
-        return -2147483648LL + level;
-    }
-    qFatal("no level codes for module id %d", moduleId);
-}
-
 } // namespace
 
 class TestTraceGlue : public QObject
@@ -98,19 +84,23 @@ private slots:
             m_loaded = *g_ptTraceInfoAlarmSearchSrv;
     }
 
-    // Every test runs with the trace object as loaded and with each of its parts missing.
+    // Every test runs with the trace object as loaded and with each of its parts missing. The
+    // level code is the module id shifted by 8 plus the level, wrapped to 32 bits.
     void initTestCase_data()
     {
         QTest::addColumn<bool>("outputs");
         QTest::addColumn<bool>("context");
         QTest::addColumn<int>("moduleId");
+        QTest::addColumn<qint64>("levelCodeBase");
         const int given = registers ? 42 : 0;
-        QTest::newRow("as loaded") << true << true << given;
+        const qint64 base = registers ? 10752 : 0;
+        QTest::newRow("as loaded") << true << true << given << base;
         if (!libraryPresent)
             return;
-        QTest::newRow("no output function") << false << true << given;
-        QTest::newRow("null context") << true << false << given;
-        QTest::newRow("module id reaching the sign bit") << true << true << 0x800000;
+        QTest::newRow("no output function") << false << true << given << base;
+        QTest::newRow("null context") << true << false << given << base;
+        QTest::newRow("module id reaching the sign bit")
+            << true << true << 0x800000 << -(1LL << 31);
     }
 
     void init()
@@ -118,9 +108,11 @@ private slots:
         QFETCH_GLOBAL(bool, outputs);
         QFETCH_GLOBAL(bool, context);
         QFETCH_GLOBAL(int, moduleId);
+        QFETCH_GLOBAL(qint64, levelCodeBase);
         m_outputs = outputs;
         m_checks = libraryPresent && context;
-        m_moduleId = g_nGivenModIdAlarmSearchSrv = moduleId;
+        m_levelCodeBase = levelCodeBase;
+        g_nGivenModIdAlarmSearchSrv = moduleId;
         if (libraryPresent) {
             *g_ptTraceInfoAlarmSearchSrv = m_loaded;
             if (!outputs)
@@ -131,28 +123,26 @@ private slots:
         recorder.reset();
     }
 
-    // An entry log writes its entry line at construction and its exit line (checked with line 0)
-    // at destruction; a failure line's arguments are evaluated only when the check passes.
+    // An entry log writes its entry line when made and its exit line (checked with line 0) when
+    // left, also by an exception; a failure line's arguments are evaluated only when the check
+    // passes.
     void lines_data()
     {
         QTest::addColumn<int>("kind");
         QTest::addColumn<QString>("status");
         QTest::addColumn<bool>("refused");
-        QTest::addColumn<QStringList>("written");
-        const QStringList entry{"X, Enter", "X, Leave"};
-        QTest::newRow("entry") << int(Entry) << QString() << false << entry;
-        QTest::newRow("entry left by an exception")
-            << int(EntryThrows) << QString() << false << entry;
-        QTest::newRow("entry refused") << int(Entry) << QString() << true << entry;
-        const auto failure = [](const char* name, const QString& status, bool refused = false) {
-            QTest::newRow(name) << int(Failure) << status << refused
-                                << QStringList{"queryAlarmCB, failed, " + status};
+        const auto row = [](const char* name, Kind kind, const QString& status = {},
+                            bool refused = false) {
+            QTest::newRow(name) << int(kind) << status << refused;
         };
-        failure("failure", "80000001");
-        failure("failure, null status", QString());
-        failure("failure, percent signs stay text", "100% %s %n");
-        failure("failure, non-ASCII", QStringLiteral("St\u00f6rung"));
-        failure("failure refused", "1", true);
+        row("entry", Entry);
+        row("entry left by an exception", EntryThrows);
+        row("entry refused", Entry, {}, true);
+        row("failure", Failure, "80000001");
+        row("failure, null status", Failure);
+        row("failure, percent signs stay text", Failure, "100% %s %n");
+        row("failure, non-ASCII", Failure, QStringLiteral("St\u00f6rung"));
+        row("failure refused", Failure, "1", true);
     }
 
     void lines()
@@ -160,36 +150,38 @@ private slots:
         QFETCH(int, kind);
         QFETCH(QString, status);
         QFETCH(bool, refused);
-        QFETCH(QStringList, written);
-        const int level =
-            kind == Failure ? AlarmSearchTrace::LevelFailure : AlarmSearchTrace::LevelEntry;
+        const bool failure = kind == Failure;
+        const qint64 code = m_levelCodeBase + (failure ? AlarmSearchTrace::LevelFailure
+                                                       : AlarmSearchTrace::LevelEntry);
         if (refused)
-            recorder.refuse(levelCode(m_moduleId, level));
+            recorder.refuse(code);
         int evaluated = 0;
         const auto argument = [&] {
             ++evaluated;
             return AlarmSearchTrace::local8Bit(status);
         };
-        QStringList atEnter;
         const int line = __LINE__ + 2;
-        if (kind == Failure)
+        if (failure)
             ALARMSEARCH_TRACE_FAILURE("%s, failed, %s", "queryAlarmCB", argument().constData());
         try {
-            if (kind != Failure) {
+            if (!failure) {
                 EntryLog log(__FILE__, "X", line);
-                atEnter = recorder.journal();
                 if (kind == EntryThrows)
                     throw std::runtime_error("left by an exception");
             }
         } catch (const std::runtime_error&) {
         }
-        QStringList expectedJournal;
-        for (int i = 0; i < written.size(); ++i)
-            expectedJournal << expected(level, i ? 0 : line, written.at(i), refused);
-        if (kind != Failure)
-            QCOMPARE(atEnter, expected(level, line, written.first(), refused));
-        QCOMPARE(evaluated, kind == Failure && m_checks && !refused ? 1 : 0);
-        QCOMPARE(recorder.journal(), expectedJournal);
+        const QStringList written = failure ? QStringList{"queryAlarmCB, failed, " + status}
+                                            : QStringList{"X, Enter", "X, Leave"};
+        QStringList expected;
+        for (int i = 0; m_checks && i < written.size(); ++i) {
+            expected
+                << QStringLiteral("check %1 0 %2:%3").arg(code).arg(__FILE__).arg(i ? 0 : line);
+            if (m_outputs && !refused)
+                expected << "out " + written.at(i);
+        }
+        QCOMPARE(evaluated, failure && m_checks && !refused ? 1 : 0);
+        QCOMPARE(recorder.journal(), expected);
     }
 
     // Last: a second owner loads and registers again, and closing it turns tracing off so that
@@ -211,25 +203,11 @@ private slots:
 private:
     enum Kind { Entry, EntryThrows, Failure };
 
-    // Journal entries of one line at level from this file's line.
-    QStringList expected(int level, int line, const QString& text, bool refused) const
-    {
-        if (!m_checks)
-            return {};
-        QStringList entries{QStringLiteral("check %1 0 %2:%3")
-                                .arg(levelCode(m_moduleId, level))
-                                .arg(__FILE__)
-                                .arg(line)};
-        if (m_outputs && !refused)
-            entries << QStringLiteral("out ") + text;
-        return entries;
-    }
-
-    const QStringList m_loadJournal = recorder.journal(); // constructed before any other test
+    const QStringList m_loadJournal = recorder.journal(); // made before any test changes it
     TraceGlobalObject m_loaded{};
     bool m_outputs = true;
     bool m_checks = true;
-    int m_moduleId = 0;
+    qint64 m_levelCodeBase = 0;
 };
 
 // The plug-in's lines: entry and exit of the host-facing operations, and every failure line of
@@ -322,7 +300,7 @@ private slots:
 };
 
 // Our stand-in trace library, loaded by its path; it reads its environment when loaded, so each
-// case loads it afresh.
+// case loads it afresh. (tst_pluginloader reads its lines through the plug-in.)
 class TestStandInTraceLibrary : public QObject
 {
     Q_OBJECT
@@ -349,20 +327,17 @@ class TestStandInTraceLibrary : public QObject
             return id;
         }
         // Writes like the glue does: a check, then the line if the check passed.
-        bool trace(int32_t moduleId, int level, const char* text) const
+        Q_ATTRIBUTE_FORMAT_PRINTF(4, 5)
+        bool trace(int32_t moduleId, int level, const char* format, ...) const
         {
             const int64_t code = static_cast<int32_t>(moduleId << 8 | level);
             if (object->checkLevel(object->context, code, 0, __FILE__, __LINE__) != 0)
                 return false;
-            write("line %d, %s", level, text);
-            return true;
-        }
-        Q_ATTRIBUTE_FORMAT_PRINTF(2, 3) void write(const char* format, ...) const
-        {
             va_list args;
             va_start(args, format);
             object->output(object->context, format, args);
             va_end(args);
+            return true;
         }
     };
 
@@ -375,6 +350,7 @@ private slots:
         qunsetenv("ZOLTLOG_LEVEL");
     }
 
+    // Which levels ZOLTLOG_LEVEL lets through; an invalid setting keeps the default, 2.
     void levels_data()
     {
         QTest::addColumn<QByteArray>("setting");
@@ -389,7 +365,6 @@ private slots:
         QTest::newRow("invalid keeps default, level 5") << QByteArray("5x") << 5 << false;
     }
 
-    // A written line is "<UTC time to the millisecond> <module> <level> <text>".
     void levels()
     {
         QFETCH(QByteArray, setting);
@@ -397,29 +372,19 @@ private slots:
         QFETCH(bool, written);
         if (!setting.isNull())
             qputenv("ZOLTLOG_LEVEL", setting);
-        const QDateTime before = QDateTime::currentDateTimeUtc().addMSecs(-1);
-        {
-            const StandIn library;
-            QCOMPARE(library.trace(library.registerModule("AlarmSearchSrv"), level, "100%s"),
-                     written);
-        }
-        const QStringList lines = readLines();
-        QCOMPARE(lines.size(), written ? 1 : 0);
-        if (!written)
-            return;
-        const QRegularExpressionMatch match = linePattern.match(lines.first());
-        QCOMPARE(match.captured(2), QStringLiteral("AlarmSearchSrv %1 line %1, 100%s").arg(level));
-        const QDateTime stamp = QDateTime::fromString(match.captured(1), Qt::ISODateWithMs);
-        QVERIFY(stamp >= before && stamp <= QDateTime::currentDateTimeUtc());
+        const StandIn library;
+        QCOMPARE(library.trace(library.registerModule("AlarmSearchSrv"), level, "-"), written);
     }
 
-    // Lines from several threads never mix, and each carries its own thread's module and level;
-    // a module registered again keeps its id.
+    // A line is "<UTC time to the millisecond> <module> <level> <text>"; lines from several
+    // threads never mix and each carries its own thread's module and level. A module registered
+    // again keeps its id.
     void concurrentLines()
     {
         qputenv("ZOLTLOG_LEVEL", "5");
         constexpr int Threads = 4;
         constexpr int LinesPerThread = 200;
+        const QDateTime before = QDateTime::currentDateTimeUtc().addMSecs(-1);
         {
             const StandIn library;
             const int32_t ids[2] = {library.registerModule("ModuleA"),
@@ -430,36 +395,32 @@ private slots:
             for (int t = 0; t < Threads; ++t) {
                 threads.emplace_back([&library, &ids, t] {
                     for (int i = 0; i < LinesPerThread; ++i)
-                        library.trace(ids[t % 2], 2 + t,
+                        library.trace(ids[t % 2], 2 + t, "line %d, %s", 2 + t,
                                       "padding-padding-padding-padding-padding-padding");
                 });
             }
             for (std::thread& thread : threads)
                 thread.join();
         }
-        const QStringList lines = readLines();
+        QFile file(m_dir.filePath("trace.log"));
+        QVERIFY(file.open(QIODevice::ReadOnly));
+        const QString content = QString::fromUtf8(file.readAll());
+        QVERIFY(content.endsWith(QLatin1Char('\n')));
+        const QStringList lines = content.split(QLatin1Char('\n'), Qt::SkipEmptyParts);
         QCOMPARE(lines.size(), Threads * LinesPerThread);
-        const QRegularExpression text(R"(^Module([AB]) ([2-5]) line \2, padding(-padding){5}$)");
+        const QRegularExpression pattern(QStringLiteral(
+            R"(^(\d{4}-\d\d-\d\dT\d\d:\d\d:\d\d\.\d{3}Z) Module([AB]) ([2-5]) line \3, padding(-padding){5}$)"));
         for (const QString& line : lines) {
-            const QRegularExpressionMatch match = text.match(linePattern.match(line).captured(2));
+            const QRegularExpressionMatch match = pattern.match(line);
             QVERIFY2(match.hasMatch(), qPrintable(line));
-            QCOMPARE(match.captured(1), QString(match.captured(2).toInt() % 2 ? "B" : "A"));
+            QCOMPARE(match.captured(2), QString(match.captured(3).toInt() % 2 ? "B" : "A"));
         }
+        const QDateTime stamp =
+            QDateTime::fromString(pattern.match(lines.first()).captured(1), Qt::ISODateWithMs);
+        QVERIFY(stamp >= before && stamp <= QDateTime::currentDateTimeUtc());
     }
 
 private:
-    // The written lines; an unterminated last line makes the whole a single unmatched line.
-    QStringList readLines() const
-    {
-        QFile file(m_dir.filePath("trace.log"));
-        const QString content =
-            file.open(QIODevice::ReadOnly) ? QString::fromUtf8(file.readAll()) : QString();
-        if (!content.isEmpty() && !content.endsWith(QLatin1Char('\n')))
-            return {QStringLiteral("unterminated: ") + content};
-        return content.split(QLatin1Char('\n'), Qt::SkipEmptyParts);
-    }
-
-    const QRegularExpression linePattern{R"(^(\d{4}-\d\d-\d\dT\d\d:\d\d:\d\d\.\d{3}Z) (.*)$)"};
     QTemporaryDir m_dir;
 };
 
