@@ -270,20 +270,19 @@ private slots:
             plugin.SubscribeEventBlock("k", "AlarmUpdated", QVariant(), sender, responser);
             plugin.UnsubscribeEventBlock("k", QVariant(), responser);
         }
-        QStringList expected;
-        for (const QString& call :
-             QStringLiteral(
-                 "InitialPluginBase|Request:handleQueryAlarm, call queryAlarm failed|"
-                 "Request:handleUpdateAlarm, call processAlarm failed|"
-                 "Request:handleGetAlarmHistory, call getAlarmInfo failed|Request|Request|"
-                 "RequestBlock|SubscribeEventBlock|UnsubscribeEventBlock|~PluginAlarmSearchSrv")
-                 .split(QLatin1Char('|'))) {
-            const QString name = call.section(QLatin1Char(':'), 0, 0);
-            const QString failure = call.section(QLatin1Char(':'), 1);
-            expected << name + ", Enter"
-                     << (failure.isEmpty() ? QStringList() : QStringList{failure})
-                     << name + ", Leave";
-        }
+        const QStringList expected =
+            QStringLiteral(
+                "InitialPluginBase, Enter|InitialPluginBase, Leave|Request, Enter|"
+                "handleQueryAlarm, call queryAlarm failed|Request, Leave|Request, Enter|"
+                "handleUpdateAlarm, call processAlarm failed|Request, Leave|Request, Enter|"
+                "handleGetAlarmHistory, call getAlarmInfo failed|Request, Leave|Request, Enter|"
+                "Request, Leave|Request, Enter|Request, Leave|RequestBlock, Enter|RequestBlock, "
+                "Leave|"
+                "SubscribeEventBlock, Enter|SubscribeEventBlock, Leave|UnsubscribeEventBlock, "
+                "Enter|"
+                "UnsubscribeEventBlock, Leave|~PluginAlarmSearchSrv, Enter|~PluginAlarmSearchSrv, "
+                "Leave")
+                .split(QLatin1Char('|'));
         QCOMPARE(recorder::lines(), expected);
         // Entry lines are checked at the operation's own line, exit lines with line 0.
         const QStringList checks = recorder::journal().filter(QStringLiteral("check 10757 "));
@@ -292,45 +291,38 @@ private slots:
         QVERIFY(checks.value(1).endsWith(QLatin1String("PluginAlarmSearchSrv.cpp:0")));
     }
 
-    void readerFailureLines_data()
-    {
-        QTest::addColumn<int>("reader");
-        QTest::addColumn<bool>("ok");
-        QTest::addColumn<QString>("status");
-        QTest::addColumn<QString>("reply");
-        QTest::addColumn<QString>("line");
-        const auto row = [](const char* name, Reader reader, bool ok, const QString& status,
-                            const QString& reply, const QString& line = {}) {
-            QTest::newRow(name) << int(reader) << ok << status << reply << line;
-        };
-        const Reader query = Reader::Query, process = Reader::Process, info = Reader::Info;
-        row("query rejected", query, true, "80000000", "<QryAlarmListRes/>",
-            "queryAlarmCB, QryAlarmList failed, 80000000");
-        row("query transport", query, false, "0", "<QryAlarmListRes/>",
-            "queryAlarmCB, QryAlarmList failed, 0");
-        row("process rejected", process, true, "FFFFFFFF", "<ProcessAlarmRes/>",
-            "processAlarmCB, processAlarm failed, FFFFFFFF");
-        row("info null status", info, false, QString(), "<GetAlarmInfoRes/>",
-            "getAlarmInfoCB, getAlarmInfo failed, ");
-        row("query unparseable", query, true, "0", "<QryAlarmListRes>",
-            "queryAlarmCB, parse message failed, <QryAlarmListRes>");
-        row("process unparseable", process, true, "0", "caf\u00e9 100%s",
-            "processAlarmCB, parse message failed, caf\u00e9 100%s");
-        row("info empty reply", info, true, "0", QString(),
-            "getAlarmInfoCB, parse message failed, ");
-        row("process accepted", process, true, "0", "<ProcessAlarmRes/>");
-        row("info accepted", info, true, "0", "<GetAlarmInfoRes/>");
-    }
-
+    // Each reader's failure lines, and none for an accepted reply.
     void readerFailureLines()
     {
-        QFETCH(int, reader);
-        QFETCH(bool, ok);
-        QFETCH(QString, status);
-        QFETCH(QString, reply);
-        QFETCH(QString, line);
-        readReply(Reader(reader), {ok, "r", status, reply, true});
-        QCOMPARE(recorder::lines(), line.isEmpty() ? QStringList() : QStringList{line});
+        const struct
+        {
+            Reader reader;
+            bool ok;
+            const char* status;
+            const char* reply;
+            const char* line;
+        } rows[] = {
+            {Reader::Query, true, "80000000", "<QryAlarmListRes/>",
+             "queryAlarmCB, QryAlarmList failed, 80000000"},
+            {Reader::Query, false, "0", "<QryAlarmListRes/>",
+             "queryAlarmCB, QryAlarmList failed, 0"},
+            {Reader::Process, true, "FFFFFFFF", "<ProcessAlarmRes/>",
+             "processAlarmCB, processAlarm failed, FFFFFFFF"},
+            {Reader::Info, false, nullptr, "<GetAlarmInfoRes/>",
+             "getAlarmInfoCB, getAlarmInfo failed, "},
+            {Reader::Query, true, "0", "<QryAlarmListRes>",
+             "queryAlarmCB, parse message failed, <QryAlarmListRes>"},
+            {Reader::Process, true, "0", "caf\u00e9 100%s",
+             "processAlarmCB, parse message failed, caf\u00e9 100%s"},
+            {Reader::Info, true, "0", nullptr, "getAlarmInfoCB, parse message failed, "},
+            {Reader::Process, true, "0", "<ProcessAlarmRes/>", ""},
+            {Reader::Info, true, "0", "<GetAlarmInfoRes/>", ""},
+        };
+        for (const auto& row : rows) {
+            recorder::reset();
+            readReply(row.reader, {row.ok, "r", row.status, row.reply, true});
+            QCOMPARE(recorder::lines().join(QLatin1Char('|')), QString::fromUtf8(row.line));
+        }
     }
 
     // Which levels ZOLTLOG_LEVEL lets through; an invalid setting keeps the default, 2.
