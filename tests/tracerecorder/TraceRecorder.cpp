@@ -1,12 +1,12 @@
-// Recording trace library that tests put in place of "libZoltLogUtl.dylib" (TraceRecorderClient.h
-// reads it). Registration gives the module id 42; TRACERECORDER_NO_REGISTER=1 leaves the
+// Recording trace library that tests put in place of "libZoltLogUtl.dylib". Its journal holds one
+// entry a call: "register <kind> <module>", "check <level code> <reserved> <file>:<line>",
+// "out <line>". Registration gives the module id 42; TRACERECORDER_NO_REGISTER=1 leaves the
 // registration entry null.
 
 #include <ZoltLogUtl.h>
 
 #include <cstdio>
 #include <cstdlib>
-#include <cstring>
 #include <mutex>
 #include <set>
 #include <string>
@@ -15,33 +15,18 @@
 
 namespace {
 
-struct Recorder
-{
-    std::mutex mutex;
-    std::string journal;
-    std::string copy; // what TraceRecorder_journal last handed out
-    std::set<int64_t> refused;
-    TraceGlobalObject object{};
-    int contextTag = 0;
-};
+std::mutex mutex;
+std::string journal;
+std::string handedOut; // what TraceRecorder_journal last handed out
+std::set<int64_t> refused;
+int contextTag = 0;
+TraceGlobalObject object{};
 
-Recorder& recorder()
+// One journal line per call; a context other than the one handed out marks the line.
+void record(void* context, const std::string& entry)
 {
-    static Recorder instance;
-    return instance;
-}
-
-// One journal line per call; a context other than the one handed out is appended to the line.
-void record(void* context, std::string entry)
-{
-    Recorder& r = recorder();
-    if (context != r.object.context) {
-        char pointer[32];
-        std::snprintf(pointer, sizeof pointer, " [context %p]", context);
-        entry += pointer;
-    }
-    std::lock_guard<std::mutex> lock(r.mutex);
-    r.journal += entry + '\n';
+    const std::lock_guard<std::mutex> lock(mutex);
+    journal += entry + (context == &contextTag ? "\n" : " [foreign context]\n");
 }
 
 void registerModule(void* context, int32_t kind, const char* moduleName, int32_t* moduleId)
@@ -57,9 +42,8 @@ int32_t checkLevel(void* context, int64_t levelCode, int64_t reserved, const cha
 {
     record(context, "check " + std::to_string(levelCode) + ' ' + std::to_string(reserved) + ' ' +
                         (file ? file : "(null)") + ':' + std::to_string(line));
-    Recorder& r = recorder();
-    std::lock_guard<std::mutex> lock(r.mutex);
-    return r.refused.count(levelCode) ? 1 : 0;
+    const std::lock_guard<std::mutex> lock(mutex);
+    return refused.count(levelCode) ? 1 : 0;
 }
 
 void output(void* context, const char* format, va_list args)
@@ -71,42 +55,38 @@ void output(void* context, const char* format, va_list args)
 
 } // namespace
 
-TRACERECORDER_EXPORT int32_t LogTrace_GetGlobalObject(int32_t, TraceGlobalObject** object)
+TRACERECORDER_EXPORT int32_t LogTrace_GetGlobalObject(int32_t, TraceGlobalObject** handed)
 {
-    Recorder& r = recorder();
     const char* noRegister = std::getenv("TRACERECORDER_NO_REGISTER");
-    r.object = TraceGlobalObject{};
-    r.object.context = &r.contextTag;
-    r.object.registerModule =
-        noRegister && !std::strcmp(noRegister, "1") ? nullptr : registerModule;
-    r.object.checkLevel = checkLevel;
-    r.object.output = output;
-    *object = &r.object;
+    const bool registers = !noRegister || std::string(noRegister) != "1";
+    object = TraceGlobalObject{};
+    object.context = &contextTag;
+    object.registerModule = registers ? registerModule : nullptr;
+    object.checkLevel = checkLevel;
+    object.output = output;
+    *handed = &object;
     return 0;
 }
 
 // The journal, one entry a line; valid until the next call.
 TRACERECORDER_EXPORT const char* TraceRecorder_journal()
 {
-    Recorder& r = recorder();
-    std::lock_guard<std::mutex> lock(r.mutex);
-    r.copy = r.journal;
-    return r.copy.c_str();
+    const std::lock_guard<std::mutex> lock(mutex);
+    handedOut = journal;
+    return handedOut.c_str();
 }
 
 // Empties the journal and forgets every refused level code.
 TRACERECORDER_EXPORT void TraceRecorder_reset()
 {
-    Recorder& r = recorder();
-    std::lock_guard<std::mutex> lock(r.mutex);
-    r.journal.clear();
-    r.refused.clear();
+    const std::lock_guard<std::mutex> lock(mutex);
+    journal.clear();
+    refused.clear();
 }
 
 // Makes the level check answer 1 (do not write) for this level code.
 TRACERECORDER_EXPORT void TraceRecorder_refuse(int64_t levelCode)
 {
-    Recorder& r = recorder();
-    std::lock_guard<std::mutex> lock(r.mutex);
-    r.refused.insert(levelCode);
+    const std::lock_guard<std::mutex> lock(mutex);
+    refused.insert(levelCode);
 }
