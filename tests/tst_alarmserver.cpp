@@ -94,15 +94,8 @@ std::unique_ptr<AlarmServer> openServer(const QString& path, int seedCount)
 {
     auto server = std::make_unique<AlarmServer>();
     QString error;
-    AlarmServer::Options options;
-    options.databasePath = path;
-    options.seedCount = seedCount;
-    options.seedEnd = kSeedEnd;
-    options.seed = 7;
-    if (!server->open(options, &error)) {
-        qWarning("%s", qPrintable(error));
-        return nullptr;
-    }
+    if (!server->open({path, seedCount, kSeedEnd, 7}, &error))
+        qFatal("%s", qPrintable(error));
     return server;
 }
 
@@ -133,7 +126,6 @@ private slots:
     void initTestCase()
     {
         m_server = openServer(u":memory:"_s, 400);
-        QVERIFY(m_server);
         m_all = query(*m_server, queryCommand());
         QCOMPARE(m_all.size(), 400);
     }
