@@ -237,7 +237,6 @@ private slots:
     {
         QCOMPARE(query(*openServer(u":memory:"_s, 400), queryCommand()), m_all);
         QSet<QString> events;
-        int processed = 0;
         for (const AlarmFields& alarm : std::as_const(m_all)) {
             events.insert(alarm["EventClass"] + '/' + alarm["SubEventType"] + '/' +
                           alarm["SubEvent"]);
@@ -247,14 +246,10 @@ private slots:
                                                    {"State", "Unhandled"},
                                                    {"Note", ""},
                                                    {"User", "system"}}));
-            QCOMPARE(entries.last()["State"], alarm["State"]);
-            if (alarm["State"] != "Unhandled"_L1) {
-                ++processed;
-                QCOMPARE(entries.last()["Note"], alarm["Note"]);
-            }
+            QCOMPARE(entries.last()["State"] + u'|' + entries.last()["Note"],
+                     alarm["State"] + u'|' + alarm["Note"]);
         }
         QCOMPARE(events.size(), 55);
-        QVERIFY(processed > 100);
     }
 
     void processThenInfo()
