@@ -5,8 +5,6 @@
 #include <PluginAlarmSearchCommon.h>
 
 #include <QDomDocument>
-#include <QJsonArray>
-#include <QJsonDocument>
 #include <QRegularExpression>
 #include <QSet>
 #include <QTcpSocket>
@@ -96,15 +94,8 @@ std::unique_ptr<AlarmServer> openServer(const QString& path, int seedCount)
 {
     auto server = std::make_unique<AlarmServer>();
     QString error;
-    AlarmServer::Options options;
-    options.databasePath = path;
-    options.seedCount = seedCount;
-    options.seedEnd = kSeedEnd;
-    options.seed = 7;
-    if (!server->open(options, &error)) {
-        qWarning("%s", qPrintable(error));
-        return nullptr;
-    }
+    if (!server->open({path, seedCount, kSeedEnd, 7}, &error))
+        qFatal("%s", qPrintable(error));
     return server;
 }
 
@@ -135,7 +126,6 @@ private slots:
     void initTestCase()
     {
         m_server = openServer(u":memory:"_s, 400);
-        QVERIFY(m_server);
         m_all = query(*m_server, queryCommand());
         QCOMPARE(m_all.size(), 400);
     }
@@ -214,14 +204,6 @@ private slots:
                    return a["ServerTime"] >= m_all.at(300)["ServerTime"] &&
                           a["ServerTime"] <= m_all.at(100)["ServerTime"];
                });
-        QTest::newRow("events, state and time together")
-            << events(u"<Event>CamEvent</Event>"_s) +
-                   "<AlarmStateList><State>Handled</State></AlarmStateList>"
-            << "2026-11-01T00:00:00"
-            << "" << AlarmPredicate([](const AlarmFields& a) {
-                   return a["EventClass"] == "CamEvent"_L1 && a["State"] == "Handled"_L1 &&
-                          a["ServerTime"] >= "2026-11-01T00:00:00Z"_L1;
-               });
     }
 
     void queryFilters()
@@ -255,7 +237,6 @@ private slots:
     {
         QCOMPARE(query(*openServer(u":memory:"_s, 400), queryCommand()), m_all);
         QSet<QString> events;
-        int processed = 0;
         for (const AlarmFields& alarm : std::as_const(m_all)) {
             events.insert(alarm["EventClass"] + '/' + alarm["SubEventType"] + '/' +
                           alarm["SubEvent"]);
@@ -265,14 +246,10 @@ private slots:
                                                    {"State", "Unhandled"},
                                                    {"Note", ""},
                                                    {"User", "system"}}));
-            QCOMPARE(entries.last()["State"], alarm["State"]);
-            if (alarm["State"] != "Unhandled"_L1) {
-                ++processed;
-                QCOMPARE(entries.last()["Note"], alarm["Note"]);
-            }
+            QCOMPARE(entries.last()["State"] + u'|' + entries.last()["Note"],
+                     alarm["State"] + u'|' + alarm["Note"]);
         }
         QCOMPARE(events.size(), 55);
-        QVERIFY(processed > 100);
     }
 
     void processThenInfo()
@@ -287,12 +264,12 @@ private slots:
         QCOMPARE(elementsOf(reply.replyText, u"Result"_s),
                  (QList<AlarmFields>{{{"AlarmID", "B12"}, {"Code", "1"}},
                                      {{"AlarmID", first}, {"Code", "0"}}}));
-        QCOMPARE(info(*m_server, first, u"Alarm"_s).first()["State"], u"Handled"_s);
-        QCOMPARE(info(*m_server, first, u"Alarm"_s).first()["Note"], note);
-        const AlarmFields entry{
-            {"Time", ""}, {"State", "Handled"}, {"Note", note}, {"User", "operator"}};
+        const AlarmFields alarm = info(*m_server, first, u"Alarm"_s).first();
+        QCOMPARE(alarm["State"] + alarm["Note"], u"Handled"_s + note);
         QList<AlarmFields> after = info(*m_server, first, u"Entry"_s);
         after.last()["Time"].clear();
+        const AlarmFields entry{
+            {"Time", ""}, {"State", "Handled"}, {"Note", note}, {"User", "operator"}};
         QCOMPARE(after, before + QList<AlarmFields>{entry});
 
         // Without a Status the state stays; the note and the log still change.
@@ -322,7 +299,7 @@ private slots:
         }
         QCOMPARE(query(*m_server, queryCommand()).at(5)["Muted"], u"false"_s);
 
-        m_server->execute(u"MuteAlarm"_s, muteCommand(ids.mid(0, 1), false, 0));
+        m_server->execute(u"MuteAlarm"_s, muteCommand(ids.mid(0, 1), false, 60));
         const AlarmFields unmuted = info(*m_server, ids.first(), u"Alarm"_s).first();
         QCOMPARE(unmuted["Muted"] + unmuted["MuteUntil"], u"false"_s);
     }
@@ -372,37 +349,20 @@ private slots:
         QCOMPARE(reply.replyText, QString());
     }
 
-    void persistsAcrossReopen()
-    {
-        QTemporaryDir dir;
-        const QString path = dir.filePath(u"nested/alarms.sqlite"_s);
-        std::unique_ptr<AlarmServer> server = openServer(path, 50);
-        QVERIFY(server);
-        const QString id = query(*server, queryCommand()).at(7)["AlarmID"];
-        server->execute(u"ProcessAlarm"_s, processCommand({id}, u"FalseAlarm"_s, u"cat"_s));
-        const QString before = server->execute(u"QryAlarmList"_s, queryCommand()).replyText;
-        server.reset();
-
-        server = openServer(path, 50);
-        QVERIFY(server);
-        QCOMPARE(server->execute(u"QryAlarmList"_s, queryCommand()).replyText, before);
-        QCOMPARE(info(*server, id, u"Entry"_s).last()["Note"], u"cat"_s);
-    }
-
-    // Four threads each change ten alarms and list all of them meanwhile, in memory and in a file.
+    // Four threads each change ten alarms and list all of them meanwhile, in memory and in a file
+    // (in a folder still to be made), which keeps the changes when it is opened again.
     void concurrentExecute_data()
     {
         QTest::addColumn<bool>("inFile");
         QTest::newRow("memory") << false;
         QTest::newRow("file") << true;
     }
-
     void concurrentExecute()
     {
         QFETCH(bool, inFile);
         QTemporaryDir dir;
-        const std::unique_ptr<AlarmServer> server =
-            openServer(inFile ? dir.filePath(u"alarms.sqlite"_s) : u":memory:"_s, 200);
+        const QString path = inFile ? dir.filePath(u"nested/alarms.sqlite"_s) : u":memory:"_s;
+        std::unique_ptr<AlarmServer> server = openServer(path, 200);
         QAtomicInt failures;
         std::vector<std::unique_ptr<QThread>> threads;
         for (int t = 0; t < 4; ++t) {
@@ -426,6 +386,11 @@ private slots:
         QCOMPARE(std::count_if(alarms.begin(), alarms.end(),
                                [](const AlarmFields& a) { return a["Note"] == "done"_L1; }),
                  40);
+        if (inFile) {
+            server.reset();
+            server = openServer(path, 200);
+            QCOMPARE(query(*server, queryCommand()), alarms);
+        }
     }
 
     void framing_data()
@@ -502,8 +467,6 @@ private slots:
                                                                 : id < requests ? u"80000004"_s
                                                                                 : u"80000002"_s);
         }
-        QCOMPARE(elementsOf(replies.first().value("reply").toString(), u"Alarm"_s).size(),
-                 m_all.size());
     }
 
     // Clients past the cap are closed at once; a request frame longer than a request may be

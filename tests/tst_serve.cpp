@@ -16,6 +16,8 @@
 #include <QTimer>
 #include <QWebSocket>
 
+#include <tuple>
+
 using namespace Qt::StringLiterals;
 
 namespace {
@@ -110,19 +112,13 @@ public:
 };
 
 // Runs the command-line client to its end: its exit code, standard output and standard error.
-struct Run
-{
-    int exitCode = -1;
-    QByteArray out;
-    QByteArray err;
-};
-Run cli(const QStringList& arguments)
+std::tuple<int, QByteArray, QByteArray> cli(const QStringList& arguments)
 {
     QProcess process;
     process.start(QStringLiteral(ALARMSEARCH_CLI_EXE), arguments);
     process.closeWriteChannel();
     if (!process.waitForFinished(60000) || process.exitStatus() != QProcess::NormalExit)
-        return {};
+        return {-1, {}, {}};
     return {process.exitCode(), process.readAllStandardOutput(), process.readAllStandardError()};
 }
 
@@ -304,7 +300,8 @@ private slots:
                      {"alarmId", "A0000006"}, {"alarmStatus", "Handled"}, {"updateResult", 0}}}));
 
         const QJsonObject last =
-            QJsonDocument::fromJson(cli({u"history"_s, u"A0000006"_s, u"--host"_s, host}).out)
+            QJsonDocument::fromJson(
+                std::get<1>(cli({u"history"_s, u"A0000006"_s, u"--host"_s, host})))
                 .object()
                 .value("result"_L1)
                 .toArray()
@@ -315,9 +312,9 @@ private slots:
 
         // An unknown alarm is named, and the command fails, as without --host (it crashed).
         for (const QString& command : {u"history NOPE"_s, u"mute NOPE A0000001"_s}) {
-            const Run unknown = cli(command.split(u' ') + QStringList{u"--host"_s, host});
-            QCOMPARE(unknown.exitCode, 1);
-            QVERIFY(unknown.err.contains("unknown alarm: NOPE"));
+            const auto [code, out, err] = cli(command.split(u' ') + QStringList{u"--host"_s, host});
+            QCOMPARE(code, 1);
+            QVERIFY(err.contains("unknown alarm: NOPE"));
         }
     }
 
