@@ -101,49 +101,51 @@ private slots:
     {
         QTest::addColumn<QString>("message");
         QTest::addColumn<QString>("expected");
-        const auto query = [this](const QVariant& args) {
+        const auto query = [this](const QVariantMap& args) {
             return composer.composeQueryAlarmListMessage(args);
         };
         const auto sha256 = [&](const QString& filter) {
             return QString::fromLatin1(
-                QCryptographicHash::hash(
-                    query(QVariantMap{{ARG_TRIGGER_EVENT_FILTER, filter}}).toUtf8(),
-                    QCryptographicHash::Sha256)
+                QCryptographicHash::hash(query({{ARG_TRIGGER_EVENT_FILTER, filter}}).toUtf8(),
+                                         QCryptographicHash::Sha256)
                     .toHex());
         };
         const QString none = expectedQuery("<TriggerEventList/>");
-        QTest::newRow("no filters, empty map") << query(QVariantMap()) << none;
-        QTest::newRow("no filters, invalid") << query(QVariant()) << none;
-        QTest::newRow("no filters, text") << query(QStringLiteral("<Filters/>")) << none;
-        QTest::newRow("no filters, list") << query(QVariantList{ARG_START_TIME, "x"}) << none;
+        QTest::newRow("no filters, empty map") << query({}) << none;
+        QTest::newRow("no filters, invalid")
+            << composer.composeQueryAlarmListMessage(QVariant()) << none;
+        QTest::newRow("no filters, text")
+            << composer.composeQueryAlarmListMessage(QStringLiteral("<Filters/>")) << none;
+        QTest::newRow("no filters, list")
+            << composer.composeQueryAlarmListMessage(QVariantList{ARG_START_TIME, "x"}) << none;
 
         const QString rules = ARG_RULES;
         QTest::newRow("rule without type is a name list")
-            << query(QVariantMap{{rules, QVariantList{rule({}, {"a"})}}})
+            << query({{rules, QVariantList{rule({}, {"a"})}}})
             << expectedQuery("<TriggerEventList/><NameList><Name>a</Name></NameList>");
         QTest::newRow("rule of type 2 adds nothing")
-            << query(QVariantMap{{rules, QVariantList{rule(2, {"a"}), rule(-1, {"b"})}}}) << none;
+            << query({{rules, QVariantList{rule(2, {"a"}), rule(-1, {"b"})}}}) << none;
         QTest::newRow("device rule without tags")
-            << query(QVariantMap{{rules, QVariantList{rule(1, {}), rule(QStringLiteral("1"), {})}}})
+            << query({{rules, QVariantList{rule(1, {}), rule(QStringLiteral("1"), {})}}})
             << expectedQuery("<TriggerEventList/><TriggerDeviceNameList/><TriggerDeviceNameList/>");
         // A value where a list is expected reads as a list of that one value.
         const QString tagList = QStringLiteral("tagList");
         QTest::newRow("tag lists as text")
-            << query(QVariantMap{{rules, QVariantList{QVariantMap{{"type", 0}, {tagList, "ab"}},
-                                                      QVariantMap{{"type", 1}, {tagList, "cd"}}}}})
+            << query({{rules, QVariantList{QVariantMap{{"type", 0}, {tagList, "ab"}},
+                                           QVariantMap{{"type", 1}, {tagList, "cd"}}}}})
             << expectedQuery(
                    "<TriggerEventList/><NameList><Name>ab</Name></NameList>"
                    "<TriggerDeviceNameList><DeviceName>cd</DeviceName></TriggerDeviceNameList>");
-        QTest::newRow("rules as text") << query(QVariantMap{{rules, "abc"}})
-                                       << expectedQuery("<TriggerEventList/><NameList/>");
+        QTest::newRow("rules as text")
+            << query({{rules, "abc"}}) << expectedQuery("<TriggerEventList/><NameList/>");
         QTest::newRow("rules as one map")
-            << query(QVariantMap{{rules, QVariantMap{{"type", 1}, {tagList, QVariantList{"x"}}}}})
+            << query({{rules, QVariantMap{{"type", 1}, {tagList, QVariantList{"x"}}}}})
             << expectedQuery("<TriggerEventList/><TriggerDeviceNameList><DeviceName>x</DeviceName>"
                              "</TriggerDeviceNameList>");
         const QVariantList tags{"a b", "x/y", QStringLiteral("caf\u00e9"), "", 42, "R&D<1>"};
         QTest::newRow("names percent-encoded, device names escaped")
-            << query(QVariantMap{
-                   {rules, QVariantList{rule(0, tags + QVariantList{"A-z_0.~"}), rule(1, tags)}}})
+            << query(
+                   {{rules, QVariantList{rule(0, tags + QVariantList{"A-z_0.~"}), rule(1, tags)}}})
             << expectedQuery(
                    "<TriggerEventList/><NameList><Name>a%20b</Name><Name>x%2Fy</Name>"
                    "<Name>caf%C3%A9</Name><Name></Name><Name>42</Name><Name>R%26D%3C1%3E</Name>"
@@ -153,11 +155,10 @@ private slots:
                    "<DeviceName>42</DeviceName><DeviceName>R&amp;D&lt;1></DeviceName>"
                    "</TriggerDeviceNameList>");
         QTest::newRow("filters in order")
-            << query(QVariantMap{
-                   {ARG_TRIGGER_EVENT_FILTER, "<Event>RecErr</Event>"},
-                   {ARG_STATE_FILTER, "<State>Unhandled</State>"},
-                   {rules, QVariantList{rule(1, {"d"}), rule(0, {"n"}), rule(1, {"e"})}},
-                   {ARG_RELAY_PATH, "ignored"}})
+            << query({{ARG_TRIGGER_EVENT_FILTER, "<Event>RecErr</Event>"},
+                      {ARG_STATE_FILTER, "<State>Unhandled</State>"},
+                      {rules, QVariantList{rule(1, {"d"}), rule(0, {"n"}), rule(1, {"e"})}},
+                      {ARG_RELAY_PATH, "ignored"}})
             << expectedQuery(
                    "<TriggerEventList><Event>RecErr</Event></TriggerEventList><State>Unhandled</"
                    "State>"
@@ -165,27 +166,24 @@ private slots:
                    "<NameList><Name>n</Name></NameList>"
                    "<TriggerDeviceNameList><DeviceName>e</DeviceName></TriggerDeviceNameList>");
         QTest::newRow("broken trigger filter kept up to the fault")
-            << query(QVariantMap{{ARG_TRIGGER_EVENT_FILTER, "<Event>X</Event><Event>"}})
+            << query({{ARG_TRIGGER_EVENT_FILTER, "<Event>X</Event><Event>"}})
             << expectedQuery("<TriggerEventList><Event>X</Event><Event/></TriggerEventList>");
         QTest::newRow("trigger filter cannot leave its list")
-            << query(QVariantMap{
-                   {ARG_TRIGGER_EVENT_FILTER, "</TriggerEventList><Evil/><TriggerEventList>"}})
+            << query({{ARG_TRIGGER_EVENT_FILTER, "</TriggerEventList><Evil/><TriggerEventList>"}})
             << none;
-        QTest::newRow("broken state filter")
-            << query(QVariantMap{{ARG_STATE_FILTER, "<State>Unhandled"}})
-            << expectedQuery("<TriggerEventList/><State/>");
+        QTest::newRow("broken state filter") << query({{ARG_STATE_FILTER, "<State>Unhandled"}})
+                                             << expectedQuery("<TriggerEventList/><State/>");
         QTest::newRow("state filter with two elements")
-            << query(QVariantMap{{ARG_STATE_FILTER, "<A>1</A><B/>"}})
+            << query({{ARG_STATE_FILTER, "<A>1</A><B/>"}})
             << expectedQuery("<TriggerEventList/><A>1</A>");
-        QTest::newRow("state filter not XML")
-            << query(QVariantMap{{ARG_STATE_FILTER, "Unhandled"}}) << none;
-        QTest::newRow("times") << query(QVariantMap{{ARG_START_TIME, "2024-01-01T00:00:00"},
-                                                    {ARG_END_TIME, "2024-01-31T23:59:59"}})
+        QTest::newRow("state filter not XML") << query({{ARG_STATE_FILTER, "Unhandled"}}) << none;
+        QTest::newRow("times") << query({{ARG_START_TIME, "2024-01-01T00:00:00"},
+                                         {ARG_END_TIME, "2024-01-31T23:59:59"}})
                                << expectedQuery(
                                       "<TriggerEventList/>",
                                       timeBound("2024-01-01T00:00:00", "2024-01-31T23:59:59"));
         QTest::newRow("start time only")
-            << query(QVariantMap{{ARG_START_TIME, "2024-01-01"}})
+            << query({{ARG_START_TIME, "2024-01-01"}})
             << expectedQuery(
                    "<TriggerEventList/>",
                    "<TmBound><TZ>+00:00</TZ><StartTm>2024-01-01</StartTm><EndTm/></TmBound>");
