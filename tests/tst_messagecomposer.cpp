@@ -40,31 +40,26 @@ QVariantMap rule(const QVariant& type, const QVariantList& tags)
     return entry;
 }
 
-bool isWellFormed(const QString& xml)
+// Element and attribute names in document order, e.g. "A[id](B()C())"; empty for text that is
+// not well-formed XML.
+QString structureOf(const QString& xml)
 {
     QXmlStreamReader reader(xml);
-    while (!reader.atEnd())
+    QString shape;
+    while (!reader.atEnd()) {
         reader.readNext();
-    return !reader.hasError();
-}
-
-// Element and attribute names of the tree in document order, e.g. "A[id](B()C())".
-QString structureOf(const QDomElement& element)
-{
-    QString shape = element.tagName();
-    const QDomNamedNodeMap attributes = element.attributes();
-    if (!attributes.isEmpty()) {
+        if (reader.isEndElement())
+            shape += u')';
+        if (!reader.isStartElement())
+            continue;
         QStringList names;
-        for (int i = 0; i < attributes.count(); ++i)
-            names.append(attributes.item(i).nodeName());
+        for (const QXmlStreamAttribute& attribute : reader.attributes())
+            names.append(attribute.name().toString());
         names.sort();
-        shape += QLatin1Char('[') + names.join(QLatin1Char(',')) + QLatin1Char(']');
+        shape += reader.name().toString() +
+                 (names.isEmpty() ? QString() : '[' + names.join(',') + ']') + '(';
     }
-    shape += QLatin1Char('(');
-    for (QDomElement child = element.firstChildElement(); !child.isNull();
-         child = child.nextSiblingElement())
-        shape += structureOf(child);
-    return shape + QLatin1Char(')');
+    return reader.hasError() ? QString() : shape;
 }
 
 QDomElement parsed(const QString& xml)
@@ -93,7 +88,7 @@ private slots:
     {
         // Before any time zone is looked up.
         qputenv("TZ", "UTC");
-        QVERIFY(!isWellFormed(QStringLiteral("<a>\x01</a>")));
+        QVERIFY(structureOf(QStringLiteral("<a>\x01</a>")).isEmpty());
     }
 
     // Every command's exact bytes, and the event-class filters by the SHA-256 of their query.
@@ -287,7 +282,7 @@ private slots:
         QFETCH(bool, refused);
         const QString message = composer.composeQueryAlarmListMessage(QVariantMap{{key, filter}});
         QCOMPARE(message.isEmpty(), refused);
-        QVERIFY(refused || isWellFormed(message));
+        QVERIFY(refused || !structureOf(message).isEmpty());
     }
 
     // Whatever a value holds, every command stays well-formed, keeps its shape and reads the
@@ -330,9 +325,7 @@ private slots:
         const QStringList expectedShapes = commands(plain, plain);
         const QStringList messages = commands(id, value);
         for (qsizetype i = 0; i < messages.size(); ++i) {
-            QVERIFY2(isWellFormed(messages.at(i)), qPrintable(messages.at(i)));
-            QCOMPARE(structureOf(parsed(messages.at(i))),
-                     structureOf(parsed(expectedShapes.at(i))));
+            QCOMPARE(structureOf(messages.at(i)), structureOf(expectedShapes.at(i)));
         }
 
         const QDomElement process = parsed(messages.at(0));
@@ -360,10 +353,9 @@ private slots:
         const QString message = composer.composeQueryAlarmListMessage(QVariantMap{
             {ARG_TRIGGER_EVENT_FILTER, instruction + "<Event>Motion</Event>" + instruction},
             {ARG_STATE_FILTER, "<S><A>" + instruction + "<B/></A>" + instruction + "</S>"}});
-        QVERIFY2(isWellFormed(message), qPrintable(message));
         QVERIFY2(!message.contains(QLatin1String("<?")), qPrintable(message));
-        QCOMPARE(structureOf(parsed(message).firstChildElement("Filters")),
-                 "Filters(TriggerEventList(Event())S(A(B())))");
+        QVERIFY2(structureOf(message).contains("Filters(TriggerEventList(Event())S(A(B())))"),
+                 qPrintable(message));
     }
 
     // Zones without daylight saving time, so the offset does not depend on the date.
