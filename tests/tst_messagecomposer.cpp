@@ -35,40 +35,31 @@ QString timeBound(const QString& start, const QString& end)
 QVariantMap rule(const QVariant& type, const QVariantList& tags)
 {
     QVariantMap entry{{QStringLiteral("tagList"), tags}};
-    if (type.isValid()) {
+    if (type.isValid())
         entry.insert(QStringLiteral("type"), type);
-    }
     return entry;
 }
 
-bool isWellFormed(const QString& xml)
+// Element and attribute names in document order, e.g. "A[id](B()C())"; empty for text that is
+// not well-formed XML.
+QString structureOf(const QString& xml)
 {
     QXmlStreamReader reader(xml);
+    QString shape;
     while (!reader.atEnd()) {
         reader.readNext();
-    }
-    return !reader.hasError();
-}
-
-// Element and attribute names of the tree in document order, e.g. "A[id](B()C())".
-QString structureOf(const QDomElement& element)
-{
-    QString shape = element.tagName();
-    const QDomNamedNodeMap attributes = element.attributes();
-    if (!attributes.isEmpty()) {
+        if (reader.isEndElement())
+            shape += u')';
+        if (!reader.isStartElement())
+            continue;
         QStringList names;
-        for (int i = 0; i < attributes.count(); ++i) {
-            names.append(attributes.item(i).nodeName());
-        }
+        for (const QXmlStreamAttribute& attribute : reader.attributes())
+            names.append(attribute.name().toString());
         names.sort();
-        shape += QLatin1Char('[') + names.join(QLatin1Char(',')) + QLatin1Char(']');
+        shape += reader.name().toString() +
+                 (names.isEmpty() ? QString() : '[' + names.join(',') + ']') + '(';
     }
-    shape += QLatin1Char('(');
-    for (QDomElement child = element.firstChildElement(); !child.isNull();
-         child = child.nextSiblingElement()) {
-        shape += structureOf(child);
-    }
-    return shape + QLatin1Char(')');
+    return reader.hasError() ? QString() : shape;
 }
 
 QDomElement parsed(const QString& xml)
@@ -97,137 +88,159 @@ private slots:
     {
         // Before any time zone is looked up.
         qputenv("TZ", "UTC");
-        QVERIFY(!isWellFormed(QStringLiteral("<a>\x01</a>")));
+        QVERIFY(structureOf(QStringLiteral("<a>\x01</a>")).isEmpty());
     }
 
-    void noFilters_data()
+    // Every command's exact bytes, and the event-class filters by the SHA-256 of their query.
+    void commands_data()
     {
-        QTest::addColumn<QVariant>("args");
-        QTest::newRow("empty map") << QVariant(QVariantMap());
-        QTest::newRow("invalid") << QVariant();
-        QTest::newRow("text") << QVariant(QStringLiteral("<Filters/>"));
-        QTest::newRow("list") << QVariant(QVariantList{ARG_START_TIME, QStringLiteral("x")});
-    }
-
-    void noFilters()
-    {
-        QFETCH(QVariant, args);
-        QCOMPARE(composer.composeQueryAlarmListMessage(args), expectedQuery("<TriggerEventList/>"));
-    }
-
-    void queryMessage_data()
-    {
-        QTest::addColumn<QVariantMap>("request");
-        QTest::addColumn<QString>("filters");
-        QTest::addColumn<QString>("timeBound");
+        QTest::addColumn<QString>("message");
+        QTest::addColumn<QString>("expected");
+        const auto query = [this](const QVariantMap& args) {
+            return composer.composeQueryAlarmListMessage(args);
+        };
+        const auto sha256 = [&](const QString& filter) {
+            return QString::fromLatin1(
+                QCryptographicHash::hash(query({{ARG_TRIGGER_EVENT_FILTER, filter}}).toUtf8(),
+                                         QCryptographicHash::Sha256)
+                    .toHex());
+        };
+        const QString none = expectedQuery("<TriggerEventList/>");
+        QTest::newRow("no filters, empty map") << query({}) << none;
+        QTest::newRow("no filters, invalid")
+            << composer.composeQueryAlarmListMessage(QVariant()) << none;
+        QTest::newRow("no filters, text")
+            << composer.composeQueryAlarmListMessage(QStringLiteral("<Filters/>")) << none;
+        QTest::newRow("no filters, list")
+            << composer.composeQueryAlarmListMessage(QVariantList{ARG_START_TIME, "x"}) << none;
 
         const QString rules = ARG_RULES;
         QTest::newRow("rule without type is a name list")
-            << QVariantMap{{rules, QVariantList{rule({}, {"a"})}}}
-            << "<TriggerEventList/><NameList><Name>a</Name></NameList>" << EmptyTimeBound;
+            << query({{rules, QVariantList{rule({}, {"a"})}}})
+            << expectedQuery("<TriggerEventList/><NameList><Name>a</Name></NameList>");
         QTest::newRow("rule of type 2 adds nothing")
-            << QVariantMap{{rules, QVariantList{rule(2, {"a"}), rule(-1, {"b"})}}}
-            << "<TriggerEventList/>" << EmptyTimeBound;
+            << query({{rules, QVariantList{rule(2, {"a"}), rule(-1, {"b"})}}}) << none;
         QTest::newRow("device rule without tags")
-            << QVariantMap{{rules, QVariantList{rule(1, {}), rule(QStringLiteral("1"), {})}}}
-            << "<TriggerEventList/><TriggerDeviceNameList/><TriggerDeviceNameList/>"
-            << EmptyTimeBound;
+            << query({{rules, QVariantList{rule(1, {}), rule(QStringLiteral("1"), {})}}})
+            << expectedQuery("<TriggerEventList/><TriggerDeviceNameList/><TriggerDeviceNameList/>");
         // A value where a list is expected reads as a list of that one value.
         const QString tagList = QStringLiteral("tagList");
         QTest::newRow("tag lists as text")
-            << QVariantMap{{rules, QVariantList{QVariantMap{{"type", 0}, {tagList, "ab"}},
-                                                QVariantMap{{"type", 1}, {tagList, "cd"}}}}}
-            << "<TriggerEventList/><NameList><Name>ab</Name></NameList>"
-               "<TriggerDeviceNameList><DeviceName>cd</DeviceName></TriggerDeviceNameList>"
-            << EmptyTimeBound;
+            << query({{rules, QVariantList{QVariantMap{{"type", 0}, {tagList, "ab"}},
+                                           QVariantMap{{"type", 1}, {tagList, "cd"}}}}})
+            << expectedQuery(
+                   "<TriggerEventList/><NameList><Name>ab</Name></NameList>"
+                   "<TriggerDeviceNameList><DeviceName>cd</DeviceName></TriggerDeviceNameList>");
         QTest::newRow("rules as text")
-            << QVariantMap{{rules, "abc"}} << "<TriggerEventList/><NameList/>" << EmptyTimeBound;
+            << query({{rules, "abc"}}) << expectedQuery("<TriggerEventList/><NameList/>");
         QTest::newRow("rules as one map")
-            << QVariantMap{{rules, QVariantMap{{"type", 1}, {tagList, QVariantList{"x"}}}}}
-            << "<TriggerEventList/><TriggerDeviceNameList><DeviceName>x</DeviceName>"
-               "</TriggerDeviceNameList>"
-            << EmptyTimeBound;
+            << query({{rules, QVariantMap{{"type", 1}, {tagList, QVariantList{"x"}}}}})
+            << expectedQuery("<TriggerEventList/><TriggerDeviceNameList><DeviceName>x</DeviceName>"
+                             "</TriggerDeviceNameList>");
+        const QVariantList tags{"a b", "x/y", QStringLiteral("caf\u00e9"), "", 42, "R&D<1>"};
         QTest::newRow("names percent-encoded, device names escaped")
-            << QVariantMap{{rules, QVariantList{rule(0, {"a b", "x/y", QStringLiteral("caf\u00e9"),
-                                                         "", 42, "R&D<1>", "A-z_0.~"}),
-                                                rule(1, {"a b", "x/y", QStringLiteral("caf\u00e9"),
-                                                         "", 42, "R&D<1>"})}}}
-            << "<TriggerEventList/><NameList><Name>a%20b</Name><Name>x%2Fy</Name>"
-               "<Name>caf%C3%A9</Name><Name></Name><Name>42</Name><Name>R%26D%3C1%3E</Name>"
-               "<Name>A-z_0.~</Name></NameList><TriggerDeviceNameList>"
-               "<DeviceName>a b</DeviceName><DeviceName>x/y</DeviceName>"
-               "<DeviceName>caf\u00e9</DeviceName><DeviceName></DeviceName>"
-               "<DeviceName>42</DeviceName><DeviceName>R&amp;D&lt;1></DeviceName>"
-               "</TriggerDeviceNameList>"
-            << EmptyTimeBound;
+            << query(
+                   {{rules, QVariantList{rule(0, tags + QVariantList{"A-z_0.~"}), rule(1, tags)}}})
+            << expectedQuery(
+                   "<TriggerEventList/><NameList><Name>a%20b</Name><Name>x%2Fy</Name>"
+                   "<Name>caf%C3%A9</Name><Name></Name><Name>42</Name><Name>R%26D%3C1%3E</Name>"
+                   "<Name>A-z_0.~</Name></NameList><TriggerDeviceNameList>"
+                   "<DeviceName>a b</DeviceName><DeviceName>x/y</DeviceName>"
+                   "<DeviceName>caf\u00e9</DeviceName><DeviceName></DeviceName>"
+                   "<DeviceName>42</DeviceName><DeviceName>R&amp;D&lt;1></DeviceName>"
+                   "</TriggerDeviceNameList>");
         QTest::newRow("filters in order")
-            << QVariantMap{{ARG_TRIGGER_EVENT_FILTER, "<Event>RecErr</Event>"},
-                           {ARG_STATE_FILTER, "<State>Unhandled</State>"},
-                           {rules, QVariantList{rule(1, {"d"}), rule(0, {"n"}), rule(1, {"e"})}},
-                           {ARG_RELAY_PATH, "ignored"}}
-            << "<TriggerEventList><Event>RecErr</Event></TriggerEventList><State>Unhandled</State>"
-               "<TriggerDeviceNameList><DeviceName>d</DeviceName></TriggerDeviceNameList>"
-               "<NameList><Name>n</Name></NameList>"
-               "<TriggerDeviceNameList><DeviceName>e</DeviceName></TriggerDeviceNameList>"
-            << EmptyTimeBound;
+            << query({{ARG_TRIGGER_EVENT_FILTER, "<Event>RecErr</Event>"},
+                      {ARG_STATE_FILTER, "<State>Unhandled</State>"},
+                      {rules, QVariantList{rule(1, {"d"}), rule(0, {"n"}), rule(1, {"e"})}},
+                      {ARG_RELAY_PATH, "ignored"}})
+            << expectedQuery(
+                   "<TriggerEventList><Event>RecErr</Event></TriggerEventList><State>Unhandled</"
+                   "State>"
+                   "<TriggerDeviceNameList><DeviceName>d</DeviceName></TriggerDeviceNameList>"
+                   "<NameList><Name>n</Name></NameList>"
+                   "<TriggerDeviceNameList><DeviceName>e</DeviceName></TriggerDeviceNameList>");
         QTest::newRow("broken trigger filter kept up to the fault")
-            << QVariantMap{{ARG_TRIGGER_EVENT_FILTER, "<Event>X</Event><Event>"}}
-            << "<TriggerEventList><Event>X</Event><Event/></TriggerEventList>" << EmptyTimeBound;
+            << query({{ARG_TRIGGER_EVENT_FILTER, "<Event>X</Event><Event>"}})
+            << expectedQuery("<TriggerEventList><Event>X</Event><Event/></TriggerEventList>");
         QTest::newRow("trigger filter cannot leave its list")
-            << QVariantMap{{ARG_TRIGGER_EVENT_FILTER,
-                            "</TriggerEventList><Evil/><TriggerEventList>"}}
-            << "<TriggerEventList/>" << EmptyTimeBound;
-        QTest::newRow("broken state filter") << QVariantMap{{ARG_STATE_FILTER, "<State>Unhandled"}}
-                                             << "<TriggerEventList/><State/>" << EmptyTimeBound;
+            << query({{ARG_TRIGGER_EVENT_FILTER, "</TriggerEventList><Evil/><TriggerEventList>"}})
+            << none;
+        QTest::newRow("broken state filter") << query({{ARG_STATE_FILTER, "<State>Unhandled"}})
+                                             << expectedQuery("<TriggerEventList/><State/>");
         QTest::newRow("state filter with two elements")
-            << QVariantMap{{ARG_STATE_FILTER, "<A>1</A><B/>"}} << "<TriggerEventList/><A>1</A>"
-            << EmptyTimeBound;
-        QTest::newRow("state filter not XML") << QVariantMap{{ARG_STATE_FILTER, "Unhandled"}}
-                                              << "<TriggerEventList/>" << EmptyTimeBound;
-        QTest::newRow("times") << QVariantMap{{ARG_START_TIME, "2024-01-01T00:00:00"},
-                                              {ARG_END_TIME, "2024-01-31T23:59:59"}}
-                               << "<TriggerEventList/>"
-                               << timeBound("2024-01-01T00:00:00", "2024-01-31T23:59:59");
+            << query({{ARG_STATE_FILTER, "<A>1</A><B/>"}})
+            << expectedQuery("<TriggerEventList/><A>1</A>");
+        QTest::newRow("state filter not XML") << query({{ARG_STATE_FILTER, "Unhandled"}}) << none;
+        QTest::newRow("times") << query({{ARG_START_TIME, "2024-01-01T00:00:00"},
+                                         {ARG_END_TIME, "2024-01-31T23:59:59"}})
+                               << expectedQuery(
+                                      "<TriggerEventList/>",
+                                      timeBound("2024-01-01T00:00:00", "2024-01-31T23:59:59"));
         QTest::newRow("start time only")
-            << QVariantMap{{ARG_START_TIME, "2024-01-01"}} << "<TriggerEventList/>"
-            << "<TmBound><TZ>+00:00</TZ><StartTm>2024-01-01</StartTm><EndTm/></TmBound>";
+            << query({{ARG_START_TIME, "2024-01-01"}})
+            << expectedQuery(
+                   "<TriggerEventList/>",
+                   "<TmBound><TZ>+00:00</TZ><StartTm>2024-01-01</StartTm><EndTm/></TmBound>");
+        QTest::newRow("camera filter")
+            << sha256(CAMERA_TRIGGER_EVENT_FILTER_STRING)
+            << "09ed63e962397e140b5805e8b3969e8d687cb098c2c1979a17f750c865318847";
+        QTest::newRow("system filter")
+            << sha256(SYSTEM_TRIGGER_EVENT_FILTER_STRING)
+            << "f3fd67d544d37bc18e8a09428e05471a18be670c32a62ed3fc2b2b5baf874220";
+        QTest::newRow("external device filter")
+            << sha256(EXTERNAL_DEVICE_TRIGGER_EVENT_FILTER_STRING)
+            << "e4db1416429096a08eccba2fccede38182ed2ea3a18ed88b90a1aa4c857b1275";
+
+        const auto process = [this](const QStringList& ids, const QVariantMap& status,
+                                    const QString& note) {
+            return composer.composeProcessAlarmMessage(ids, status, note);
+        };
+        QTest::newRow("process, empty")
+            << process({}, {}, {}) << "<ProcessAlarm><AlarmList></AlarmList></ProcessAlarm>";
+        QTest::newRow("process, duplicates kept in order")
+            << process({"7", "3", "7"}, {{ARG_ALARM_STATUS, "Handled"}}, "checked")
+            << "<ProcessAlarm><AlarmList><Alarm ID=\"7\"/><Alarm ID=\"3\"/><Alarm ID=\"7\"/>"
+               "</AlarmList><Status><State>Handled</State></Status><Note>checked</Note>"
+               "</ProcessAlarm>";
+        QTest::newRow("process, status map without the key")
+            << process({"1"}, {{"AlarmStatus", "Handled"}}, {})
+            << "<ProcessAlarm><AlarmList><Alarm ID=\"1\"/></AlarmList><Status></Status>"
+               "</ProcessAlarm>";
+        QTest::newRow("process, values escaped")
+            << process({"1\"/><Alarm ID=\"2"}, {{ARG_ALARM_STATUS, "<Evil/>&"}}, "a<b & \"c\" >")
+            << "<ProcessAlarm><AlarmList><Alarm ID=\"1&quot;/&gt;&lt;Alarm ID=&quot;2\"/>"
+               "</AlarmList><Status><State>&lt;Evil/&gt;&amp;</State></Status>"
+               "<Note>a&lt;b &amp; &quot;c&quot; &gt;</Note></ProcessAlarm>";
+        QTest::newRow("process, empty state")
+            << process({}, {{ARG_ALARM_STATUS, ""}}, {})
+            << "<ProcessAlarm><AlarmList></AlarmList><Status><State></State></Status>"
+               "</ProcessAlarm>";
+
+        QTest::newRow("info, empty") << composer.composeGetAlarmInfoMessage({})
+                                     << "<GetAlarmInfo><AlarmID></AlarmID></GetAlarmInfo>";
+        QTest::newRow("info") << composer.composeGetAlarmInfoMessage("1234")
+                              << "<GetAlarmInfo><AlarmID>1234</AlarmID></GetAlarmInfo>";
+
+        const auto mute = [](const QString& ids, const QString& mute, const QString& interval) {
+            return "<MuteAlarm><EventTimecardIDList>" + ids + "</EventTimecardIDList><Mute>" +
+                   mute + "</Mute><MuteInterval>" + interval + "</MuteInterval></MuteAlarm>";
+        };
+        QTest::newRow("mute, no ids")
+            << composer.composeMuteAlarmMessage({}, true, 0) << mute("", "true", "0");
+        QTest::newRow("unmute, duplicates kept in order")
+            << composer.composeMuteAlarmMessage({"b", "a", "b"}, false, -1)
+            << mute("<ID>b</ID><ID>a</ID><ID>b</ID>", "false", "-1");
+        QTest::newRow("mute, extreme interval")
+            << composer.composeMuteAlarmMessage({"1"}, true, std::numeric_limits<int>::min())
+            << mute("<ID>1</ID>", "true", "-2147483648");
     }
 
-    void queryMessage()
+    void commands()
     {
-        QFETCH(QVariantMap, request);
-        QFETCH(QString, filters);
-        QFETCH(QString, timeBound);
-        const QString message = composer.composeQueryAlarmListMessage(request);
-        QCOMPARE(message, expectedQuery(filters, timeBound));
-        QVERIFY(isWellFormed(message));
-    }
-
-    // The event-class filters go out exactly as the server knows them: each whole query by its
-    // SHA-256.
-    void eventClassFilters_data()
-    {
-        QTest::addColumn<QString>("filter");
-        QTest::addColumn<QByteArray>("sha256");
-        QTest::newRow("camera")
-            << CAMERA_TRIGGER_EVENT_FILTER_STRING
-            << QByteArray("09ed63e962397e140b5805e8b3969e8d687cb098c2c1979a17f750c865318847");
-        QTest::newRow("system")
-            << SYSTEM_TRIGGER_EVENT_FILTER_STRING
-            << QByteArray("f3fd67d544d37bc18e8a09428e05471a18be670c32a62ed3fc2b2b5baf874220");
-        QTest::newRow("external device")
-            << EXTERNAL_DEVICE_TRIGGER_EVENT_FILTER_STRING
-            << QByteArray("e4db1416429096a08eccba2fccede38182ed2ea3a18ed88b90a1aa4c857b1275");
-    }
-
-    void eventClassFilters()
-    {
-        QFETCH(QString, filter);
-        QFETCH(QByteArray, sha256);
-        const QString message =
-            composer.composeQueryAlarmListMessage(QVariantMap{{ARG_TRIGGER_EVENT_FILTER, filter}});
-        QCOMPARE(QCryptographicHash::hash(message.toUtf8(), QCryptographicHash::Sha256).toHex(),
-                 sha256);
+        QFETCH(QString, message);
+        QFETCH(QString, expected);
+        QCOMPARE(message, expected);
     }
 
     // Filters beyond the bounds of a fragment are not written at all (the request is refused):
@@ -269,97 +282,7 @@ private slots:
         QFETCH(bool, refused);
         const QString message = composer.composeQueryAlarmListMessage(QVariantMap{{key, filter}});
         QCOMPARE(message.isEmpty(), refused);
-        QVERIFY(refused || isWellFormed(message));
-    }
-
-    void processMessage_data()
-    {
-        QTest::addColumn<QStringList>("ids");
-        QTest::addColumn<QVariantMap>("status");
-        QTest::addColumn<QString>("note");
-        QTest::addColumn<QString>("expected");
-
-        QTest::newRow("empty") << QStringList() << QVariantMap() << QString()
-                               << "<ProcessAlarm><AlarmList></AlarmList></ProcessAlarm>";
-        QTest::newRow("typical, duplicates kept in order")
-            << QStringList{"7", "3", "7"} << QVariantMap{{ARG_ALARM_STATUS, "Handled"}} << "checked"
-            << "<ProcessAlarm><AlarmList><Alarm ID=\"7\"/><Alarm ID=\"3\"/><Alarm ID=\"7\"/>"
-               "</AlarmList><Status><State>Handled</State></Status><Note>checked</Note>"
-               "</ProcessAlarm>";
-        QTest::newRow("status map without the key")
-            << QStringList{"1"} << QVariantMap{{"AlarmStatus", "Handled"}} << QString()
-            << "<ProcessAlarm><AlarmList><Alarm ID=\"1\"/></AlarmList><Status></Status>"
-               "</ProcessAlarm>";
-        QTest::newRow("values escaped")
-            << QStringList{"1\"/><Alarm ID=\"2"} << QVariantMap{{ARG_ALARM_STATUS, "<Evil/>&"}}
-            << "a<b & \"c\" >"
-            << "<ProcessAlarm><AlarmList><Alarm ID=\"1&quot;/&gt;&lt;Alarm ID=&quot;2\"/>"
-               "</AlarmList><Status><State>&lt;Evil/&gt;&amp;</State></Status>"
-               "<Note>a&lt;b &amp; &quot;c&quot; &gt;</Note></ProcessAlarm>";
-        QTest::newRow("empty state")
-            << QStringList() << QVariantMap{{ARG_ALARM_STATUS, ""}} << QString()
-            << "<ProcessAlarm><AlarmList></AlarmList><Status><State></State></Status>"
-               "</ProcessAlarm>";
-    }
-
-    void processMessage()
-    {
-        QFETCH(QStringList, ids);
-        QFETCH(QVariantMap, status);
-        QFETCH(QString, note);
-        QFETCH(QString, expected);
-        const QString message = composer.composeProcessAlarmMessage(ids, status, note);
-        QCOMPARE(message, expected);
-        QVERIFY(isWellFormed(message));
-    }
-
-    void alarmInfoMessage_data()
-    {
-        QTest::addColumn<QString>("alarmId");
-        QTest::addColumn<QString>("expected");
-        QTest::newRow("empty") << QString() << "<GetAlarmInfo><AlarmID></AlarmID></GetAlarmInfo>";
-        QTest::newRow("typical") << "1234"
-                                 << "<GetAlarmInfo><AlarmID>1234</AlarmID></GetAlarmInfo>";
-    }
-
-    void alarmInfoMessage()
-    {
-        QFETCH(QString, alarmId);
-        QFETCH(QString, expected);
-        const QString message = composer.composeGetAlarmInfoMessage(alarmId);
-        QCOMPARE(message, expected);
-        QVERIFY(isWellFormed(message));
-    }
-
-    void muteMessage_data()
-    {
-        QTest::addColumn<QStringList>("ids");
-        QTest::addColumn<bool>("mute");
-        QTest::addColumn<int>("interval");
-        QTest::addColumn<QString>("expected");
-
-        const auto message = [](const QString& ids, const QString& mute, const QString& interval) {
-            return "<MuteAlarm><EventTimecardIDList>" + ids + "</EventTimecardIDList><Mute>" +
-                   mute + "</Mute><MuteInterval>" + interval + "</MuteInterval></MuteAlarm>";
-        };
-        QTest::newRow("no ids") << QStringList() << true << 0 << message("", "true", "0");
-        QTest::newRow("unmute, duplicates kept in order")
-            << QStringList{"b", "a", "b"} << false << -1
-            << message("<ID>b</ID><ID>a</ID><ID>b</ID>", "false", "-1");
-        QTest::newRow("extreme intervals")
-            << QStringList{"1"} << true << std::numeric_limits<int>::min()
-            << message("<ID>1</ID>", "true", "-2147483648");
-    }
-
-    void muteMessage()
-    {
-        QFETCH(QStringList, ids);
-        QFETCH(bool, mute);
-        QFETCH(int, interval);
-        QFETCH(QString, expected);
-        const QString message = composer.composeMuteAlarmMessage(ids, mute, interval);
-        QCOMPARE(message, expected);
-        QVERIFY(isWellFormed(message));
+        QVERIFY(refused || !structureOf(message).isEmpty());
     }
 
     // Whatever a value holds, every command stays well-formed, keeps its shape and reads the
@@ -372,9 +295,8 @@ private slots:
         const QStringList markup{"\"",        "'",      "<",           ">",   "&",
                                  "&amp;",     "</x>",   "\"/><E a=\"", "]]>", "<!--",
                                  "<![CDATA[", "<?pi?>", "%1%2%3",      "&#1;"};
-        for (const QString& value : markup) {
+        for (const QString& value : markup)
             QTest::newRow(qPrintable(value)) << value << value;
-        }
         QTest::newRow("line breaks and tabs") << "a\r\nb\rc\td\n"
                                               << "a\r\nb\rc\td\n";
         QTest::newRow("control character") << QStringLiteral("a\x01z") << "az";
@@ -403,9 +325,7 @@ private slots:
         const QStringList expectedShapes = commands(plain, plain);
         const QStringList messages = commands(id, value);
         for (qsizetype i = 0; i < messages.size(); ++i) {
-            QVERIFY2(isWellFormed(messages.at(i)), qPrintable(messages.at(i)));
-            QCOMPARE(structureOf(parsed(messages.at(i))),
-                     structureOf(parsed(expectedShapes.at(i))));
+            QCOMPARE(structureOf(messages.at(i)), structureOf(expectedShapes.at(i)));
         }
 
         const QDomElement process = parsed(messages.at(0));
@@ -433,33 +353,24 @@ private slots:
         const QString message = composer.composeQueryAlarmListMessage(QVariantMap{
             {ARG_TRIGGER_EVENT_FILTER, instruction + "<Event>Motion</Event>" + instruction},
             {ARG_STATE_FILTER, "<S><A>" + instruction + "<B/></A>" + instruction + "</S>"}});
-        QVERIFY2(isWellFormed(message), qPrintable(message));
         QVERIFY2(!message.contains(QLatin1String("<?")), qPrintable(message));
-        QCOMPARE(structureOf(parsed(message).firstChildElement("Filters")),
-                 "Filters(TriggerEventList(Event())S(A(B())))");
+        QVERIFY2(structureOf(message).contains("Filters(TriggerEventList(Event())S(A(B())))"),
+                 qPrintable(message));
     }
 
-    void systemTimeZone_data()
-    {
-        QTest::addColumn<QByteArray>("zone");
-        QTest::addColumn<QString>("offset");
-        QTest::newRow("UTC") << QByteArray("UTC") << "+00:00";
-        // Zones without daylight saving time, so the offset does not depend on the date.
-        QTest::newRow("Kathmandu") << QByteArray("Asia/Kathmandu") << "+05:45";
-        QTest::newRow("Marquesas") << QByteArray("Pacific/Marquesas") << "-09:30";
-    }
-
+    // Zones without daylight saving time, so the offset does not depend on the date.
     void systemTimeZone()
     {
-        QFETCH(QByteArray, zone);
-        QFETCH(QString, offset);
-        if (!QTimeZone::isTimeZoneIdAvailable(zone)) {
-            QSKIP("time zone data not installed");
+        for (const auto& [zone, offset] :
+             {std::pair("UTC", "+00:00"), std::pair("Asia/Kathmandu", "+05:45"),
+              std::pair("Pacific/Marquesas", "-09:30")}) {
+            if (!QTimeZone::isTimeZoneIdAvailable(zone))
+                QSKIP("time zone data not installed");
+            qputenv("TZ", zone);
+            const QString result = composer.getSystemTimeZone();
+            qputenv("TZ", "UTC");
+            QCOMPARE(result, QLatin1String(offset));
         }
-        qputenv("TZ", zone);
-        const QString result = composer.getSystemTimeZone();
-        qputenv("TZ", "UTC");
-        QCOMPARE(result, offset);
     }
 };
 

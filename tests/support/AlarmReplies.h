@@ -2,6 +2,7 @@
 
 #include <QString>
 #include <QStringList>
+#include <QTime>
 
 // Alarm-list replies as the alarm server writes them, with varied but repeatable values: some
 // notes carry "&amp;", non-ASCII text and characters outside the basic plane, some alarms are
@@ -31,13 +32,9 @@ inline QString alarm(int n)
     const QString& subEvent = subEvents.at(n % subEvents.size());
     const QString& note = notes.at((n / 3) % notes.size());
     const bool muted = n % 7 == 0;
-    const int second = n % 60;
-    const int minute = (n / 60) % 60;
-    const int hour = (n / 3600) % 24;
-    const QString time = QStringLiteral("2026-11-20T%1:%2:%3Z")
-                             .arg(hour, 2, 10, QLatin1Char('0'))
-                             .arg(minute, 2, 10, QLatin1Char('0'))
-                             .arg(second, 2, 10, QLatin1Char('0'));
+    const QString time = QStringLiteral("2026-11-20T%1Z")
+                             .arg(QTime::fromMSecsSinceStartOfDay(n % 86400 * 1000)
+                                      .toString(QStringLiteral("HH:mm:ss")));
     QString xml = QStringLiteral("<Alarm>");
     xml += QStringLiteral("<AlarmID>A%1</AlarmID>").arg(n, 7, 10, QLatin1Char('0'));
     xml += QStringLiteral("<EventClass>CamEvent</EventClass><SubEventType>CameraEvent"
@@ -79,19 +76,9 @@ constexpr Shape Shapes[] = {Shape::ThirtyFields, Shape::LongNonAscii, Shape::Esc
 
 inline const char* shapeName(Shape shape)
 {
-    switch (shape) {
-    case Shape::ThirtyFields:
-        return "30 fields";
-    case Shape::LongNonAscii:
-        return "long non-ASCII names and notes";
-    case Shape::Escaped:
-        return "escaped text";
-    case Shape::Attributes:
-        return "attributes";
-    case Shape::DistinctNames:
-        return "a distinct name per alarm";
-    }
-    return "";
+    static const char* const names[] = {"30 fields", "long non-ASCII names and notes",
+                                        "escaped text", "attributes", "a distinct name per alarm"};
+    return names[int(shape)];
 }
 
 inline QString shapedAlarm(Shape shape, int n)

@@ -61,22 +61,10 @@ public:
         };
     }
 
-    QList<Event> events() const
-    {
-        std::lock_guard lock(m_mutex);
-        return m_events;
-    }
-    QList<Answer> answers() const
-    {
-        std::lock_guard lock(m_mutex);
-        return m_answers;
-    }
+    QList<Event> events() const { return locked(m_events); }
+    QList<Answer> answers() const { return locked(m_answers); }
     // Events and answers in the order they arrived.
-    QStringList journal() const
-    {
-        std::lock_guard lock(m_mutex);
-        return m_journal;
-    }
+    QStringList journal() const { return locked(m_journal); }
 
     FakeTunnelClient tunnel;
     IOrvoTunnelClient* tunnelClient = &tunnel;
@@ -84,6 +72,12 @@ public:
     int tunnelClientAsked = 0;
 
 private:
+    template <typename T> T locked(const T& value) const
+    {
+        std::lock_guard lock(m_mutex);
+        return value;
+    }
+
     mutable std::mutex m_mutex;
     QList<Event> m_events;
     QList<Answer> m_answers;

@@ -55,11 +55,10 @@ public:
         std::lock_guard lock(m_mutex);
         return m_records;
     }
-
     Record last() const
     {
-        std::lock_guard lock(m_mutex);
-        return m_records.isEmpty() ? Record() : m_records.constLast();
+        const QList<Record> all = records();
+        return all.value(all.size() - 1);
     }
 
     // Delivers a reply to the last request on the calling thread.
