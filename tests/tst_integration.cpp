@@ -352,7 +352,7 @@ private slots:
         QTemporaryDir dir;
         const QString db = dir.filePath(u"alarms.sqlite"_s);
         const auto onDb = [&](const QString& arguments) {
-            const Run done =
+            Run done =
                 cli(QStringList{u"--db"_s, db, u"--seed-count"_s, u"5100"_s} + words(arguments));
             if (done.exitCode != 0)
                 qFatal("%s failed: %s", qPrintable(arguments), done.err.constData());

@@ -367,6 +367,7 @@ private slots:
             QCOMPARE(ids[1], 2);
             QCOMPARE(library.registerModule("ModuleA"), 1);
             std::vector<std::thread> threads;
+            threads.reserve(Threads);
             for (int t = 0; t < Threads; ++t) {
                 threads.emplace_back([&library, &ids, t] {
                     for (int i = 0; i < LinesPerThread; ++i)

@@ -82,7 +82,7 @@ QVariant AlarmXmlParser::readReply(const QString& replyText)
 {
     if (replyText.size() <= MaxReplyLength) {
         if (std::optional<QVariantMap> document = AlarmListScanner::readDocument(replyText))
-            return QVariant(std::move(*document));
+            return QVariant(*document);
     }
     return XML2Json().parse(replyText);
 }
