@@ -14,15 +14,13 @@ QString nested(int depth)
            QString(QStringLiteral("</e>")).repeated(depth);
 }
 
-// Depth of the rendering of nested(n): the innermost element renders as text.
-int depthOf(QVariant value)
+// The rendering of nested(depth): the innermost element renders as an empty text.
+QVariant nestedRendering(int depth)
 {
-    int depth = 0;
-    while (value.userType() == QMetaType::QVariantMap) {
-        value = value.toMap().value(QStringLiteral("e"));
-        ++depth;
-    }
-    return value.userType() == QMetaType::QString ? depth : -1;
+    QVariant value = QString("");
+    for (int i = 0; i < depth; ++i)
+        value = Map{{QStringLiteral("e"), value}};
+    return value;
 }
 
 } // namespace
@@ -41,18 +39,15 @@ private slots:
         QTest::newRow("empty element") << "<R/>" << QVariant(Map{{"R", ""}});
         QTest::newRow("whitespace around root") << "\n <?xml-stylesheet x?> <R>a</R>\n <!--c-->\n"
                                                 << QVariant(Map{{"R", "a"}});
-        QTest::newRow("empty pair") << "<R></R>" << QVariant(Map{{"R", ""}});
         QTest::newRow("leaf keeps whitespace")
             << "<R>  a b \n</R>" << QVariant(Map{{"R", "  a b \n"}});
-        QTest::newRow("whitespace-only leaf") << "<R> </R>" << QVariant(Map{{"R", " "}});
-        QTest::newRow("example") << "<R><A>1</A><A>2</A><B x=\"y\">t</B><C/></R>"
+        QTest::newRow("example") << "<R><A>1</A><A>2</A><B x=\"y\">t</B><C></C></R>"
                                  << QVariant(Map{{"R", Map{{"A", List{"1", "2"}},
                                                            {"B", Map{{"@x", "y"}, {"#text", "t"}}},
                                                            {"C", ""}}}});
-        QTest::newRow("attributes only")
-            << "<R a='1' b=\"two\"/>" << QVariant(Map{{"R", Map{{"@a", "1"}, {"@b", "two"}}}});
-        QTest::newRow("attribute and child of one name")
-            << "<R A='x'><A>y</A></R>" << QVariant(Map{{"R", Map{{"@A", "x"}, {"A", "y"}}}});
+        QTest::newRow("attributes, one the name of a child")
+            << "<R a='1' b=\"two\" A='x'><A>y</A></R>"
+            << QVariant(Map{{"R", Map{{"@a", "1"}, {"@b", "two"}, {"@A", "x"}, {"A", "y"}}}});
         QTest::newRow("repeated names keep document order")
             << "<R><A>3</A><B>b</B><A>1</A><A>2</A></R>"
             << QVariant(Map{{"R", Map{{"A", List{"3", "1", "2"}}, {"B", "b"}}}});
@@ -63,24 +58,20 @@ private slots:
             << "<R>a<B>b</B>c <C/> d</R>"
             << QVariant(Map{{"R", Map{{"B", "b"}, {"C", ""}, {"#text", "ac  d"}}}});
         QTest::newRow("whitespace between children ignored")
-            << "<R>\n  <A>1</A>\n  <B> </B>\n</R>"
-            << QVariant(Map{{"R", Map{{"A", "1"}, {"B", " "}}}});
-        QTest::newRow("whitespace text with attribute ignored")
-            << "<R a='1'>\n </R>" << QVariant(Map{{"R", Map{{"@a", "1"}}}});
+            << "<R>\n  <A>1</A>\n  <B> </B>\n  <C a='1'>\n </C>\n</R>"
+            << QVariant(Map{{"R", Map{{"A", "1"}, {"B", " "}, {"C", Map{{"@a", "1"}}}}}});
         QTest::newRow("CDATA is text")
-            << "<R><A><![CDATA[<b>&amp;</b>]]></A><B>x<![CDATA[y]]>z</B></R>"
-            << QVariant(Map{{"R", Map{{"A", "<b>&amp;</b>"}, {"B", "xyz"}}}});
-        QTest::newRow("CDATA in mixed text")
-            << "<R k='v'>a<![CDATA[ b ]]></R>"
-            << QVariant(Map{{"R", Map{{"@k", "v"}, {"#text", "a b "}}}});
+            << "<R><A><![CDATA[<b>&amp;</b>]]></A><B>x<![CDATA[y]]>z</B><C k='v'>a<![CDATA[ b "
+               "]]></C></R>"
+            << QVariant(Map{{"R", Map{{"A", "<b>&amp;</b>"},
+                                      {"B", "xyz"},
+                                      {"C", Map{{"@k", "v"}, {"#text", "a b "}}}}}});
         QTest::newRow("comments and PIs skipped")
-            << "<?xml version='1.0'?><!--c--><R><!--c--><A>1<!--c-->2</A><?pi x?><B/></R><!--c-->"
-            << QVariant(Map{{"R", Map{{"A", "12"}, {"B", ""}}}});
-        QTest::newRow("comment-only element is empty")
-            << "<R><!-- nothing --></R>" << QVariant(Map{{"R", ""}});
-        QTest::newRow("nested maps")
-            << "<R><A><B><C>deep</C><D/></B></A></R>"
-            << QVariant(Map{{"R", Map{{"A", Map{{"B", Map{{"C", "deep"}, {"D", ""}}}}}}}});
+            << "<?xml version='1.0'?><!--c--><R><!--c--><A>1<!--c-->2</A><?pi "
+               "x?><B/><C><!--c--></C></R><!--c-->"
+            << QVariant(Map{{"R", Map{{"A", "12"}, {"B", ""}, {"C", ""}}}});
+        QTest::newRow("deepest read")
+            << nested(AlarmSearchLimits::MaxDepth) << nestedRendering(AlarmSearchLimits::MaxDepth);
         QTest::newRow("entities and character references")
             << "<R a='&lt;&quot;&#x41;'><T>&amp;&lt;&gt;&apos;&quot; &#65;&#x263A;</T></R>"
             << QVariant(
@@ -105,8 +96,8 @@ private slots:
 
     void emptyTextIsNotNull()
     {
-        const QVariant root = XML2Json().parse(QStringLiteral("<R><A/></R>")).toMap().value("R");
-        const QVariant empty = root.toMap().value(QStringLiteral("A"));
+        const QVariant empty =
+            XML2Json().parse(QStringLiteral("<R><A/></R>")).toMap().value("R").toMap().value("A");
         QCOMPARE(empty.userType(), QMetaType::QString);
         QVERIFY(!empty.toString().isNull());
     }
@@ -157,7 +148,6 @@ private slots:
         QTest::newRow("entity bomb") << "<!DOCTYPE R [<!ENTITY e \"" + QString(4000, u'x') +
                                             "\">]><R>" + QStringLiteral("&e;").repeated(400000) +
                                             "</R>";
-        QTest::newRow("depth 257") << nested(AlarmSearchLimits::MaxDepth + 1);
         QTest::newRow("depth 100000") << nested(100000);
         QTest::newRow("depth 100000 unclosed") << QString(QStringLiteral("<e>")).repeated(100000);
     }
@@ -174,8 +164,6 @@ private slots:
 
     void depthBound()
     {
-        const QVariant deepest = XML2Json().parse(nested(AlarmSearchLimits::MaxDepth));
-        QCOMPARE(depthOf(deepest), AlarmSearchLimits::MaxDepth);
         XML2Json converter;
         QVERIFY(!converter.parse(nested(AlarmSearchLimits::MaxDepth + 1)).isValid());
         QVERIFY(converter.errorString().contains(QLatin1String("256")));
