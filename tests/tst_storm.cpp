@@ -24,14 +24,8 @@ enum class Kind { Query, Update, History };
 enum class Outcome { Accepted, Rejected, Unparseable };
 
 // Request i asks for kind i % 3 and gets a reply of outcome (i / 3) % 3, so every pairing occurs.
-Kind kindOf(int i)
-{
-    return Kind(i % 3);
-}
-Outcome outcomeOf(int i)
-{
-    return Outcome((i / 3) % 3);
-}
+const auto kindOf = [](int i) { return Kind(i % 3); };
+const auto outcomeOf = [](int i) { return Outcome((i / 3) % 3); };
 
 const QString permanentKey = QStringLiteral("permanent");
 const QString rejectedStatus = QStringLiteral("80000000");
@@ -76,19 +70,18 @@ QString expectedCode(Kind kind, Outcome outcome)
 }
 
 // Records what the plug-in hands back, per request; requests are told apart by relay path,
-// which is the request's index.
-class Tally
+// which is the request's index. Read the fields under the mutex.
+struct Tally
 {
-public:
-    explicit Tally(int requests) { m_counts.answers.resize(requests); }
+    explicit Tally(int requests) { answers.resize(requests); }
 
     HDLR_DO_REQUEST_CB answerSink(int index)
     {
         return [this, index](bool, const QString& code, const QString&, const QVariant&) {
-            std::lock_guard lock(m_mutex);
-            m_counts.answers[index].append(code);
-            if (kindOf(index) == Kind::Update && m_pluginDeleted)
-                ++m_counts.updateAnswersAfterDeletion;
+            std::lock_guard lock(mutex);
+            answers[index].append(code);
+            if (kindOf(index) == Kind::Update && pluginDeleted)
+                ++updateAnswersAfterDeletion;
         };
     }
 
@@ -97,50 +90,26 @@ public:
         return [this](const PluginObjBase_EventSignalInfo* info) {
             const QVariantMap data = info->eventData.toMap();
             const int index = data.value(ARG_RELAY_PATH).toString().toInt();
-            std::lock_guard lock(m_mutex);
+            std::lock_guard lock(mutex);
             const bool understoodUpdate =
                 kindOf(index) == Kind::Update && outcomeOf(index) == Outcome::Accepted;
-            if (!understoodUpdate || !m_everSubscribed.contains(info->subscriptionKey) ||
-                data.value(ARG_ALARM_UPDATED_RESULTS).toList().size() != 2 || m_pluginDeleted)
-                ++m_counts.badEvents;
+            if (!understoodUpdate || !everSubscribed.contains(info->subscriptionKey) ||
+                data.value(ARG_ALARM_UPDATED_RESULTS).toList().size() != 2 || pluginDeleted)
+                ++badEvents;
             if (info->subscriptionKey == permanentKey)
-                m_counts.permanentEvents.append(index);
-            ++m_counts.events;
+                permanentEvents.append(index);
+            ++events;
         };
     }
 
-    // Called before the key is subscribed, so that every event for it finds it here.
-    void willSubscribe(const QString& key)
-    {
-        std::lock_guard lock(m_mutex);
-        m_everSubscribed.insert(key);
-    }
-
-    void pluginDeleted()
-    {
-        std::lock_guard lock(m_mutex);
-        m_pluginDeleted = true;
-    }
-
-    struct Counts
-    {
-        QList<QStringList> answers;
-        QList<int> permanentEvents;
-        int events = 0;
-        int badEvents = 0;
-        int updateAnswersAfterDeletion = 0;
-    };
-    Counts counts() const
-    {
-        std::lock_guard lock(m_mutex);
-        return m_counts;
-    }
-
-private:
-    mutable std::mutex m_mutex;
-    Counts m_counts;
-    QSet<QString> m_everSubscribed;
-    bool m_pluginDeleted = false;
+    std::mutex mutex;
+    QList<QStringList> answers;
+    QList<int> permanentEvents;
+    int events = 0;
+    int badEvents = 0;
+    int updateAnswersAfterDeletion = 0;
+    QSet<QString> everSubscribed; // a key enters before it is subscribed
+    bool pluginDeleted = false;
 };
 
 // A started plug-in whose host events go to the tally, with the given requests pending.
@@ -166,7 +135,10 @@ struct Storm
 
     void subscribe(const QString& key)
     {
-        tally.willSubscribe(key);
+        {
+            std::lock_guard lock(tally.mutex);
+            tally.everSubscribed.insert(key);
+        }
         UntouchedResponser responser;
         plugin->SubscribeEventBlock(key, EVENT_ALARM_UPDATED, QVariant(), RequestSenderInfo(),
                                     responser);
@@ -224,7 +196,8 @@ private slots:
         subscriber.join();
 
         // Every reply produced exactly one answer, with the code its kind and outcome call for.
-        const Tally::Counts counts = storm.tally.counts();
+        // All threads are joined: the tally is read without its lock.
+        const Tally& counts = storm.tally;
         const QList<QStringList>& answers = counts.answers;
         QList<int> understoodUpdates;
         for (int i = 0; i < Requests; ++i) {
@@ -254,7 +227,8 @@ private slots:
             while (delivered.load() < Requests / 2)
                 std::this_thread::yield();
             storm.plugin.reset();
-            storm.tally.pluginDeleted();
+            std::lock_guard lock(storm.tally.mutex);
+            storm.tally.pluginDeleted = true;
         });
         onThreads(4, [&](int thread) {
             for (int i = thread; i < Requests; i += 4) {
@@ -272,7 +246,7 @@ private slots:
         // Queries and history reads need nothing of the plug-in and are answered every time;
         // an update is answered at most once, never after the deletion, and publishes nothing
         // then.
-        const Tally::Counts counts = storm.tally.counts();
+        const Tally& counts = storm.tally;
         const QList<QStringList>& answers = counts.answers;
         for (int i = 0; i < Requests; ++i) {
             if (kindOf(i) == Kind::Update)
