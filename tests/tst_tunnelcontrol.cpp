@@ -151,24 +151,6 @@ private slots:
         }
     }
 
-    // A refused request, or one without a tunnel client, is refused and never answered.
-    void refusedAndMissingClient()
-    {
-        FakeTunnelClient tunnel;
-        tunnel.setAccept(false);
-        ORVOSrvTunnelControl refusing(&tunnel);
-        ORVOSrvTunnelControl detached(nullptr);
-        ReaderOutcome outcome;
-        const QVariantMap args{{ARG_ALARMINFO_ID_LIST, QStringList{"1"}}};
-        for (ORVOSrvTunnelControl* control : {&refusing, &detached})
-            for (const Operation operation : {Query, Process, Info})
-                QVERIFY(!run(*control, operation, args, outcome));
-        run(refusing, Mute, args, outcome);
-        run(detached, Mute, args, outcome);
-        QCOMPARE(tunnel.records().size(), 4);
-        QCOMPARE(outcome.calls, 0);
-    }
-
     // Every reader judges the status and reads the reply the same way; flags and relay path pass
     // through on every path.
     void readers_data()
