@@ -30,13 +30,6 @@ const auto outcomeOf = [](int i) { return Outcome((i / 3) % 3); };
 const QString permanentKey = QStringLiteral("permanent");
 const QString rejectedStatus = QStringLiteral("80000000");
 
-QString methodOf(Kind kind)
-{
-    const QString methods[] = {METHOD_QUERY_ALARM_LIST, METHOD_UPDATE_ALARM,
-                               METHOD_GET_ALARM_HISTORY};
-    return methods[int(kind)];
-}
-
 QString acceptedReply(Kind kind)
 {
     const char* const replies[] = {
@@ -48,17 +41,17 @@ QString acceptedReply(Kind kind)
     return QString::fromUtf8(replies[int(kind)]);
 }
 
-// Delivers the reply of the given outcome to a recorded request.
-void deliver(const FakeTunnelClient::Record& record, Kind kind, Outcome outcome)
+// Delivers request i's reply, of its kind and outcome.
+void deliver(const QList<FakeTunnelClient::Record>& records, int i)
 {
     FakeTunnelClient::Reply reply;
-    reply.relayPath = record.relayPath;
-    reply.replyText = acceptedReply(kind);
-    if (outcome == Outcome::Rejected)
+    reply.relayPath = records.at(i).relayPath;
+    reply.replyText = acceptedReply(kindOf(i));
+    if (outcomeOf(i) == Outcome::Rejected)
         reply.statusText = rejectedStatus;
-    else if (outcome == Outcome::Unparseable)
+    else if (outcomeOf(i) == Outcome::Unparseable)
         reply.replyText = QStringLiteral("<ProcessAlarmRes><Result>");
-    FakeTunnelClient::deliver(record, reply);
+    FakeTunnelClient::deliver(records.at(i), reply);
 }
 
 // The answer code a reply of this kind and outcome must produce.
@@ -98,14 +91,12 @@ struct Tally
                 ++badEvents;
             if (info->subscriptionKey == permanentKey)
                 permanentEvents.append(index);
-            ++events;
         };
     }
 
     std::mutex mutex;
     QList<QStringList> answers;
     QList<int> permanentEvents;
-    int events = 0;
     int badEvents = 0;
     int updateAnswersAfterDeletion = 0;
     QSet<QString> everSubscribed; // a key enters before it is subscribed
@@ -124,12 +115,13 @@ struct Storm
         host.eventSignal = tally.eventSink();
         plugin->InitialPluginBase(&host);
         subscribe(permanentKey);
-        RequestSenderInfo sender;
+        const QString methods[] = {METHOD_QUERY_ALARM_LIST, METHOD_UPDATE_ALARM,
+                                   METHOD_GET_ALARM_HISTORY};
         for (int i = 0; i < requests; ++i) {
             const QVariantMap args{{ARG_RELAY_PATH, QString::number(i)},
-                                   {ARG_ALARM_ID_LIST, QStringList{QStringLiteral("A1")}},
-                                   {ARG_ALARM_ID, QStringLiteral("A1")}};
-            plugin->Request(methodOf(kindOf(i)), args, sender, tally.answerSink(i));
+                                   {ARG_ALARM_ID_LIST, QStringList{"A1"}},
+                                   {ARG_ALARM_ID, "A1"}};
+            plugin->Request(methods[int(kindOf(i))], args, {}, tally.answerSink(i));
         }
     }
 
@@ -140,8 +132,7 @@ struct Storm
             tally.everSubscribed.insert(key);
         }
         UntouchedResponser responser;
-        plugin->SubscribeEventBlock(key, EVENT_ALARM_UPDATED, QVariant(), RequestSenderInfo(),
-                                    responser);
+        plugin->SubscribeEventBlock(key, EVENT_ALARM_UPDATED, {}, {}, responser);
     }
 
     void unsubscribe(const QString& key)
@@ -180,8 +171,7 @@ private slots:
 
         std::atomic<bool> delivering{true};
         std::thread subscriber([&] {
-            const QStringList keys{QStringLiteral("k0"), QStringLiteral("k1"), QStringLiteral("k2"),
-                                   QStringLiteral("k3")};
+            const QStringList keys{"k0", "k1", "k2", "k3"};
             for (int n = 0; delivering.load(); ++n) {
                 storm.subscribe(keys.at(n % 4));
                 storm.unsubscribe(keys.at((n + 2) % 4));
@@ -190,7 +180,7 @@ private slots:
         });
         onThreads(Deliverers, [&](int thread) {
             for (int i = thread; i < Requests; i += Deliverers)
-                deliver(records.at(i), kindOf(i), outcomeOf(i));
+                deliver(records, i);
         });
         delivering = false;
         subscriber.join();
@@ -211,7 +201,6 @@ private slots:
         QList<int> permanentEvents = counts.permanentEvents;
         std::sort(permanentEvents.begin(), permanentEvents.end());
         QCOMPARE(permanentEvents, understoodUpdates);
-        QVERIFY(counts.events >= understoodUpdates.size());
     }
 
     void deletionWithRepliesPending()
@@ -232,7 +221,7 @@ private slots:
         });
         onThreads(4, [&](int thread) {
             for (int i = thread; i < Requests; i += 4) {
-                deliver(records.at(i), kindOf(i), outcomeOf(i));
+                deliver(records, i);
                 ++delivered;
             }
         });
@@ -240,7 +229,7 @@ private slots:
         // Late replies once more, all after the deletion.
         onThreads(4, [&](int thread) {
             for (int i = thread; i < Requests; i += 4)
-                deliver(records.at(i), kindOf(i), outcomeOf(i));
+                deliver(records, i);
         });
 
         // Queries and history reads need nothing of the plug-in and are answered every time;
