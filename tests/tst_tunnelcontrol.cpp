@@ -204,7 +204,8 @@ private slots:
 
     void readerResults()
     {
-        const QVariantList alarms = readAlarmList(threeAlarms).result.toList();
+        const QVariantList alarms =
+            readReply(Reader::Query, {true, "", "0", threeAlarms, true}).result.toList();
         QCOMPARE(alarms.size(), 3);
         QCOMPARE(
             alarms.at(0).toMap(),

@@ -44,9 +44,3 @@ inline ReaderOutcome readReply(Reader reader, const FakeTunnelClient::Reply& r)
             r.ok, r.relayPath, r.statusText, r.replyText, r.isLast, recordReply(out));
     return out;
 }
-
-// The alarm-list reader on an accepted exchange.
-inline ReaderOutcome readAlarmList(const QString& replyText)
-{
-    return readReply(Reader::Query, {true, QString(), QStringLiteral("0"), replyText, true});
-}
