@@ -10,8 +10,7 @@ using List = QVariantList;
 
 QString nested(int depth)
 {
-    return QString(QStringLiteral("<e>")).repeated(depth) +
-           QString(QStringLiteral("</e>")).repeated(depth);
+    return QStringLiteral("<e>").repeated(depth) + QStringLiteral("</e>").repeated(depth);
 }
 
 // The rendering of nested(depth): the innermost element renders as an empty text.
@@ -35,7 +34,6 @@ private slots:
         QTest::addColumn<QString>("xml");
         QTest::addColumn<QVariant>("expected");
 
-        QTest::newRow("leaf text") << "<R>abc</R>" << QVariant(Map{{"R", "abc"}});
         QTest::newRow("empty element") << "<R/>" << QVariant(Map{{"R", ""}});
         QTest::newRow("whitespace around root") << "\n <?xml-stylesheet x?> <R>a</R>\n <!--c-->\n"
                                                 << QVariant(Map{{"R", "a"}});
@@ -49,11 +47,10 @@ private slots:
             << "<R a='1' b=\"two\" A='x'><A>y</A></R>"
             << QVariant(Map{{"R", Map{{"@a", "1"}, {"@b", "two"}, {"@A", "x"}, {"A", "y"}}}});
         QTest::newRow("repeated names keep document order")
-            << "<R><A>3</A><B>b</B><A>1</A><A>2</A></R>"
-            << QVariant(Map{{"R", Map{{"A", List{"3", "1", "2"}}, {"B", "b"}}}});
-        QTest::newRow("repeated maps and texts mixed")
-            << "<R><A k='1'/><A>t</A><A><x>1</x></A></R>"
-            << QVariant(Map{{"R", Map{{"A", List{Map{{"@k", "1"}}, "t", Map{{"x", "1"}}}}}}});
+            << "<R><A>3</A><B>b</B><A>1</A><A>2</A><C k='1'/><C>t</C><C><x>1</x></C></R>"
+            << QVariant(Map{{"R", Map{{"A", List{"3", "1", "2"}},
+                                      {"B", "b"},
+                                      {"C", List{Map{{"@k", "1"}}, "t", Map{{"x", "1"}}}}}}});
         QTest::newRow("mixed text")
             << "<R>a<B>b</B>c <C/> d</R>"
             << QVariant(Map{{"R", Map{{"B", "b"}, {"C", ""}, {"#text", "ac  d"}}}});
@@ -76,12 +73,11 @@ private slots:
             << "<R a='&lt;&quot;&#x41;'><T>&amp;&lt;&gt;&apos;&quot; &#65;&#x263A;</T></R>"
             << QVariant(
                    Map{{"R", Map{{"@a", "<\"A"}, {"T", QString::fromUtf8("&<>'\" A\u263A")}}}});
-        QTest::newRow("qualified names as written")
-            << "<p:R xmlns:p='urn:x'><p:A>1</p:A><A>2</A></p:R>"
-            << QVariant(Map{{"p:R", Map{{"@xmlns:p", "urn:x"}, {"p:A", "1"}, {"A", "2"}}}});
-        QTest::newRow("non-ASCII text")
-            << QString::fromUtf8("<R><N>Kamera Süd 東</N></R>")
-            << QVariant(Map{{"R", Map{{"N", QString::fromUtf8("Kamera Süd 東")}}}});
+        QTest::newRow("qualified names as written, non-ASCII text")
+            << QString::fromUtf8("<p:R xmlns:p='urn:x'><p:A>1</p:A><A>Süd 東</A></p:R>")
+            << QVariant(Map{
+                   {"p:R",
+                    Map{{"@xmlns:p", "urn:x"}, {"p:A", "1"}, {"A", QString::fromUtf8("Süd 東")}}}});
     }
 
     void rendering()
