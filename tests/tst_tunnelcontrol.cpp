@@ -145,10 +145,6 @@ private slots:
         QCOMPARE(r.commandText, command);
         QCOMPARE(r.relayPath, relayPath);
         QCOMPARE(bool(r.replyCallback), operation != Mute);
-        if (r.replyCallback) {
-            tunnel.reply({true, "r", "0", threeAlarms, true});
-            QCOMPARE(outcome.calls, 1);
-        }
     }
 
     // Every reader judges the status and reads the reply the same way; flags and relay path pass
@@ -169,15 +165,11 @@ private slots:
         QTest::newRow("transport failure") << false << "0" << one << QList<int>();
         for (const char* reply : {"", "this is not xml", "<QryAlarmListRes><Alarm>", "<A/><B/>"})
             QTest::addRow("unparseable %s", reply) << true << "0" << reply << QList<int>();
-        QTest::newRow("other root")
-            << true << "0"
-            << "<Unexpected><Alarm/><Result/></Unexpected>" << QList<int>{0, 0, 0};
-        QTest::newRow("empty root") << true << "0"
-                                    << "<QryAlarmListRes/>" << QList<int>{0, 0, 0};
-        QTest::newRow("info without change log")
-            << true << "0"
-            << "<GetAlarmInfoRes><Alarm><AlarmID>1</AlarmID></Alarm></GetAlarmInfoRes>"
-            << QList<int>{0, 0, 0};
+        for (const char* reply :
+             {"<Unexpected><Alarm/><Result/></Unexpected>", "<QryAlarmListRes/>",
+              "<GetAlarmInfoRes><Alarm><AlarmID>1</AlarmID></Alarm></GetAlarmInfoRes>"})
+            QTest::addRow("nothing to read in %s", reply)
+                << true << "0" << reply << QList<int>{0, 0, 0};
     }
 
     void readers()
@@ -204,20 +196,15 @@ private slots:
 
     void readerResults()
     {
-        const QVariantList alarms =
-            readReply(Reader::Query, {true, "", "0", threeAlarms, true}).result.toList();
-        QCOMPARE(alarms.size(), 3);
-        QCOMPARE(
-            alarms.at(0).toMap(),
-            (QVariantMap{{"AlarmID", "1"},
-                         {"XML", "    <Alarm>\n        <AlarmID>1</AlarmID>\n    </Alarm>\n"}}));
         // The alarm's own "XML" child is replaced by its text.
-        QCOMPARE(alarms.at(1).toMap(),
-                 (QVariantMap{{"AlarmID", "2"},
-                              {"XML", "    <Alarm>\n        <AlarmID>2</AlarmID>\n"
-                                      "        <XML>own</XML>\n    </Alarm>\n"}}));
-        QCOMPARE(alarms.at(2).toMap(),
-                 (QVariantMap{{"@ID", "3"}, {"XML", "    <Alarm ID=\"3\"/>\n"}}));
+        QCOMPARE(readReply(Reader::Query, {true, "", "0", threeAlarms, true}).result.toList(),
+                 (QVariantList{QVariantMap{{"AlarmID", "1"},
+                                           {"XML", "    <Alarm>\n        <AlarmID>1</AlarmID>\n"
+                                                   "    </Alarm>\n"}},
+                               QVariantMap{{"AlarmID", "2"},
+                                           {"XML", "    <Alarm>\n        <AlarmID>2</AlarmID>\n"
+                                                   "        <XML>own</XML>\n    </Alarm>\n"}},
+                               QVariantMap{{"@ID", "3"}, {"XML", "    <Alarm ID=\"3\"/>\n"}}}));
 
         const QString results =
             "<ProcessAlarmRes><Result><AlarmID>7</AlarmID><Code>0</Code><Extra>x</Extra></Result>"
