@@ -23,11 +23,8 @@ QDomElement chain(QDomDocument& document, int depth)
 {
     const QDomElement deepest = document.createElement(QStringLiteral("e"));
     QDomElement top = deepest;
-    for (int i = 1; i < depth; ++i) {
-        QDomElement parent = document.createElement(QStringLiteral("e"));
-        parent.appendChild(top);
-        top = parent;
-    }
+    for (int i = 1; i < depth; ++i)
+        top = document.createElement(QStringLiteral("e")).appendChild(top).parentNode().toElement();
     document.appendChild(top);
     return deepest;
 }
@@ -183,10 +180,10 @@ private slots:
         const QString reply = "<QryAlarmListRes><Alarm><!-- not for the scanner --><N>" +
                               QStringLiteral("&amp;&lt;").repeated(500000) +
                               "</N></Alarm></QryAlarmListRes>";
-        const std::optional<QVariantList> alarms = AlarmXmlParser::readAlarmListReply(reply);
-        QVERIFY(alarms.has_value());
-        QCOMPARE(alarms->size(), 1);
-        QCOMPARE(alarms->at(0).toMap().value("N").toString().size(), 1000000);
+        const QVariantList alarms =
+            AlarmXmlParser::readAlarmListReply(reply).value_or(QVariantList());
+        QCOMPARE(alarms.size(), 1);
+        QCOMPARE(alarms.at(0).toMap().value("N").toString().size(), 1000000);
     }
 };
 

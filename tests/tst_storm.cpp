@@ -219,18 +219,13 @@ private slots:
             std::lock_guard lock(storm.tally.mutex);
             storm.tally.pluginDeleted = true;
         });
-        onThreads(4, [&](int thread) {
-            for (int i = thread; i < Requests; i += 4) {
+        const auto deliverAll = [&](int thread) {
+            for (int i = thread; i < Requests; i += 4, ++delivered)
                 deliver(records, i);
-                ++delivered;
-            }
-        });
+        };
+        onThreads(4, deliverAll);
         deleter.join();
-        // Late replies once more, all after the deletion.
-        onThreads(4, [&](int thread) {
-            for (int i = thread; i < Requests; i += 4)
-                deliver(records, i);
-        });
+        onThreads(4, deliverAll); // late replies once more, all after the deletion
 
         // Queries and history reads need nothing of the plug-in and are answered every time;
         // an update is answered at most once, never after the deletion, and publishes nothing
