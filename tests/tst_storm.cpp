@@ -30,23 +30,17 @@ const auto outcomeOf = [](int i) { return Outcome((i / 3) % 3); };
 const QString permanentKey = QStringLiteral("permanent");
 const QString rejectedStatus = QStringLiteral("80000000");
 
-QString acceptedReply(Kind kind)
+// Delivers request i's reply, of its kind and outcome.
+void deliver(const QList<FakeTunnelClient::Record>& records, int i)
 {
-    const char* const replies[] = {
+    const char* const accepted[] = {
         "<QryAlarmListRes><Alarm><ID>1</ID></Alarm></QryAlarmListRes>",
         "<ProcessAlarmRes><Result><AlarmID>A1</AlarmID><Code>0</Code></Result><Result><AlarmID>A2"
         "</AlarmID><Code>1</Code></Result></ProcessAlarmRes>",
         "<GetAlarmInfoRes><Alarm><ChangeLogs><Entry><Note>n</Note></Entry></ChangeLogs></Alarm>"
         "</GetAlarmInfoRes>"};
-    return QString::fromUtf8(replies[int(kind)]);
-}
-
-// Delivers request i's reply, of its kind and outcome.
-void deliver(const QList<FakeTunnelClient::Record>& records, int i)
-{
-    FakeTunnelClient::Reply reply;
-    reply.relayPath = records.at(i).relayPath;
-    reply.replyText = acceptedReply(kindOf(i));
+    FakeTunnelClient::Reply reply{true, records.at(i).relayPath, "0",
+                                  QString::fromUtf8(accepted[int(kindOf(i))]), true};
     if (outcomeOf(i) == Outcome::Rejected)
         reply.statusText = rejectedStatus;
     else if (outcomeOf(i) == Outcome::Unparseable)
