@@ -128,12 +128,6 @@ struct Storm
         UntouchedResponser responser;
         plugin->SubscribeEventBlock(key, EVENT_ALARM_UPDATED, {}, {}, responser);
     }
-
-    void unsubscribe(const QString& key)
-    {
-        UntouchedResponser responser;
-        plugin->UnsubscribeEventBlock(key, QVariant(), responser);
-    }
 };
 
 // Runs work(thread) on each of count threads and waits for all of them.
@@ -168,8 +162,9 @@ private slots:
             const QStringList keys{"k0", "k1", "k2", "k3"};
             for (int n = 0; delivering.load(); ++n) {
                 storm.subscribe(keys.at(n % 4));
-                storm.unsubscribe(keys.at((n + 2) % 4));
-                storm.unsubscribe(QStringLiteral("never subscribed"));
+                UntouchedResponser responser;
+                storm.plugin->UnsubscribeEventBlock(keys.at((n + 2) % 4), {}, responser);
+                storm.plugin->UnsubscribeEventBlock("never subscribed", {}, responser);
             }
         });
         onThreads(Deliverers, [&](int thread) {
