@@ -24,13 +24,10 @@ private slots:
         qputenv("ZOLTLOG_LEVEL", "5");
     }
 
+    // The id the host files the plug-in under; the interface id is checked by every host load.
     void metaData()
     {
-        QPluginLoader loader(QStringLiteral(ALARMSEARCH_PLUGIN_FILE));
-        const QJsonObject meta = loader.metaData();
-        QCOMPARE(meta.value("IID").toString(),
-                 QStringLiteral("com.KELMARO.PluginServer.PluginInterface"));
-        QCOMPARE(meta.value("className").toString(), QStringLiteral("PluginAlarmSearchSrv"));
+        const QJsonObject meta = QPluginLoader(ALARMSEARCH_PLUGIN_FILE).metaData();
         QCOMPARE(meta.value("MetaData").toObject(),
                  (QJsonObject{{"PluginID", "C758778662E44060AC6E2EC5C9AD349B"}}));
     }

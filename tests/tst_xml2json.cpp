@@ -10,19 +10,16 @@ using List = QVariantList;
 
 QString nested(int depth)
 {
-    return QString(QStringLiteral("<e>")).repeated(depth) +
-           QString(QStringLiteral("</e>")).repeated(depth);
+    return QStringLiteral("<e>").repeated(depth) + QStringLiteral("</e>").repeated(depth);
 }
 
-// Depth of the rendering of nested(n): the innermost element renders as text.
-int depthOf(QVariant value)
+// The rendering of nested(depth): the innermost element renders as an empty text.
+QVariant nestedRendering(int depth)
 {
-    int depth = 0;
-    while (value.userType() == QMetaType::QVariantMap) {
-        value = value.toMap().value(QStringLiteral("e"));
-        ++depth;
-    }
-    return value.userType() == QMetaType::QString ? depth : -1;
+    QVariant value = QString("");
+    for (int i = 0; i < depth; ++i)
+        value = Map{{QStringLiteral("e"), value}};
+    return value;
 }
 
 } // namespace
@@ -37,60 +34,50 @@ private slots:
         QTest::addColumn<QString>("xml");
         QTest::addColumn<QVariant>("expected");
 
-        QTest::newRow("leaf text") << "<R>abc</R>" << QVariant(Map{{"R", "abc"}});
-        QTest::newRow("empty element") << "<R/>" << QVariant(Map{{"R", ""}});
-        QTest::newRow("whitespace around root") << "\n <?xml-stylesheet x?> <R>a</R>\n <!--c-->\n"
-                                                << QVariant(Map{{"R", "a"}});
-        QTest::newRow("empty pair") << "<R></R>" << QVariant(Map{{"R", ""}});
+        QTest::newRow("empty element, whitespace around root")
+            << "\n <?xml-stylesheet x?> <R/>\n <!--c-->\n"
+            << QVariant(Map{{"R", ""}});
         QTest::newRow("leaf keeps whitespace")
             << "<R>  a b \n</R>" << QVariant(Map{{"R", "  a b \n"}});
-        QTest::newRow("whitespace-only leaf") << "<R> </R>" << QVariant(Map{{"R", " "}});
-        QTest::newRow("example") << "<R><A>1</A><A>2</A><B x=\"y\">t</B><C/></R>"
+        QTest::newRow("example") << "<R><A>1</A><A>2</A><B x=\"y\">t</B><C></C></R>"
                                  << QVariant(Map{{"R", Map{{"A", List{"1", "2"}},
                                                            {"B", Map{{"@x", "y"}, {"#text", "t"}}},
                                                            {"C", ""}}}});
-        QTest::newRow("attributes only")
-            << "<R a='1' b=\"two\"/>" << QVariant(Map{{"R", Map{{"@a", "1"}, {"@b", "two"}}}});
-        QTest::newRow("attribute and child of one name")
-            << "<R A='x'><A>y</A></R>" << QVariant(Map{{"R", Map{{"@A", "x"}, {"A", "y"}}}});
+        QTest::newRow("attributes, one the name of a child")
+            << "<R a='1' b=\"two\" A='x'><A>y</A></R>"
+            << QVariant(Map{{"R", Map{{"@a", "1"}, {"@b", "two"}, {"@A", "x"}, {"A", "y"}}}});
         QTest::newRow("repeated names keep document order")
-            << "<R><A>3</A><B>b</B><A>1</A><A>2</A></R>"
-            << QVariant(Map{{"R", Map{{"A", List{"3", "1", "2"}}, {"B", "b"}}}});
-        QTest::newRow("repeated maps and texts mixed")
-            << "<R><A k='1'/><A>t</A><A><x>1</x></A></R>"
-            << QVariant(Map{{"R", Map{{"A", List{Map{{"@k", "1"}}, "t", Map{{"x", "1"}}}}}}});
+            << "<R><A>3</A><B>b</B><A>1</A><A>2</A><C k='1'/><C>t</C><C><x>1</x></C></R>"
+            << QVariant(Map{{"R", Map{{"A", List{"3", "1", "2"}},
+                                      {"B", "b"},
+                                      {"C", List{Map{{"@k", "1"}}, "t", Map{{"x", "1"}}}}}}});
         QTest::newRow("mixed text")
             << "<R>a<B>b</B>c <C/> d</R>"
             << QVariant(Map{{"R", Map{{"B", "b"}, {"C", ""}, {"#text", "ac  d"}}}});
         QTest::newRow("whitespace between children ignored")
-            << "<R>\n  <A>1</A>\n  <B> </B>\n</R>"
-            << QVariant(Map{{"R", Map{{"A", "1"}, {"B", " "}}}});
-        QTest::newRow("whitespace text with attribute ignored")
-            << "<R a='1'>\n </R>" << QVariant(Map{{"R", Map{{"@a", "1"}}}});
+            << "<R>\n  <A>1</A>\n  <B> </B>\n  <C a='1'>\n </C>\n</R>"
+            << QVariant(Map{{"R", Map{{"A", "1"}, {"B", " "}, {"C", Map{{"@a", "1"}}}}}});
         QTest::newRow("CDATA is text")
-            << "<R><A><![CDATA[<b>&amp;</b>]]></A><B>x<![CDATA[y]]>z</B></R>"
-            << QVariant(Map{{"R", Map{{"A", "<b>&amp;</b>"}, {"B", "xyz"}}}});
-        QTest::newRow("CDATA in mixed text")
-            << "<R k='v'>a<![CDATA[ b ]]></R>"
-            << QVariant(Map{{"R", Map{{"@k", "v"}, {"#text", "a b "}}}});
+            << "<R><A><![CDATA[<b>&amp;</b>]]></A><B>x<![CDATA[y]]>z</B><C k='v'>a<![CDATA[ b "
+               "]]></C></R>"
+            << QVariant(Map{{"R", Map{{"A", "<b>&amp;</b>"},
+                                      {"B", "xyz"},
+                                      {"C", Map{{"@k", "v"}, {"#text", "a b "}}}}}});
         QTest::newRow("comments and PIs skipped")
-            << "<?xml version='1.0'?><!--c--><R><!--c--><A>1<!--c-->2</A><?pi x?><B/></R><!--c-->"
-            << QVariant(Map{{"R", Map{{"A", "12"}, {"B", ""}}}});
-        QTest::newRow("comment-only element is empty")
-            << "<R><!-- nothing --></R>" << QVariant(Map{{"R", ""}});
-        QTest::newRow("nested maps")
-            << "<R><A><B><C>deep</C><D/></B></A></R>"
-            << QVariant(Map{{"R", Map{{"A", Map{{"B", Map{{"C", "deep"}, {"D", ""}}}}}}}});
+            << "<?xml version='1.0'?><!--c--><R><!--c--><A>1<!--c-->2</A><?pi "
+               "x?><B/><C><!--c--></C></R><!--c-->"
+            << QVariant(Map{{"R", Map{{"A", "12"}, {"B", ""}, {"C", ""}}}});
+        QTest::newRow("deepest read")
+            << nested(AlarmSearchLimits::MaxDepth) << nestedRendering(AlarmSearchLimits::MaxDepth);
         QTest::newRow("entities and character references")
             << "<R a='&lt;&quot;&#x41;'><T>&amp;&lt;&gt;&apos;&quot; &#65;&#x263A;</T></R>"
             << QVariant(
                    Map{{"R", Map{{"@a", "<\"A"}, {"T", QString::fromUtf8("&<>'\" A\u263A")}}}});
-        QTest::newRow("qualified names as written")
-            << "<p:R xmlns:p='urn:x'><p:A>1</p:A><A>2</A></p:R>"
-            << QVariant(Map{{"p:R", Map{{"@xmlns:p", "urn:x"}, {"p:A", "1"}, {"A", "2"}}}});
-        QTest::newRow("non-ASCII text")
-            << QString::fromUtf8("<R><N>Kamera Süd 東</N></R>")
-            << QVariant(Map{{"R", Map{{"N", QString::fromUtf8("Kamera Süd 東")}}}});
+        QTest::newRow("qualified names as written, non-ASCII text")
+            << QString::fromUtf8("<p:R xmlns:p='urn:x'><p:A>1</p:A><A>Süd 東</A></p:R>")
+            << QVariant(Map{
+                   {"p:R",
+                    Map{{"@xmlns:p", "urn:x"}, {"p:A", "1"}, {"A", QString::fromUtf8("Süd 東")}}}});
     }
 
     void rendering()
@@ -98,16 +85,14 @@ private slots:
         QFETCH(QString, xml);
         QFETCH(QVariant, expected);
         XML2Json converter;
-        const QVariant result = converter.parse(xml);
-        QCOMPARE(result, expected);
+        QCOMPARE(converter.parse(xml), expected);
         QCOMPARE(converter.errorString(), QString());
     }
 
     void emptyTextIsNotNull()
     {
-        const QVariant root = XML2Json().parse(QStringLiteral("<R><A/></R>")).toMap().value("R");
-        const QVariant empty = root.toMap().value(QStringLiteral("A"));
-        QCOMPARE(empty.userType(), QMetaType::QString);
+        const QVariant empty =
+            XML2Json().parse(QStringLiteral("<R><A/></R>")).toMap().value("R").toMap().value("A");
         QVERIFY(!empty.toString().isNull());
     }
 
@@ -119,7 +104,6 @@ private slots:
         QTest::newRow("list") << QVariant(List{map, "t"}) << List{map, "t"};
         QTest::newRow("single map") << QVariant(map) << List{map};
         QTest::newRow("single text") << QVariant("t") << List{"t"};
-        QTest::newRow("single empty text") << QVariant("") << List{""};
         QTest::newRow("invalid") << QVariant() << List{};
     }
 
@@ -135,29 +119,18 @@ private slots:
         QTest::addColumn<QString>("xml");
         QTest::newRow("null text") << QString();
         QTest::newRow("empty text") << "";
-        QTest::newRow("whitespace only") << "  \n ";
-        QTest::newRow("comment only") << "<!-- c -->";
         QTest::newRow("plain text") << "not xml";
-        QTest::newRow("mismatched tags") << "<R><A></B></R>";
         QTest::newRow("truncated") << "<R><A>1</A>";
-        QTest::newRow("truncated tag") << "<R><A>1</A></R";
         QTest::newRow("two roots") << "<R/><S/>";
-        QTest::newRow("text after root") << "<R/>tail";
-        QTest::newRow("duplicate attribute") << "<R a='1' a='2'/>";
-        QTest::newRow("unquoted attribute") << "<R a=1/>";
         QTest::newRow("raw U+0001") << QStringLiteral("<R>a") + QChar(0x1) + QStringLiteral("</R>");
         QTest::newRow("reference to U+0001") << "<R>&#1;</R>";
         QTest::newRow("undeclared entity") << "<R>&nbsp;</R>";
-        QTest::newRow("lone ampersand") << "<R>a & b</R>";
         QTest::newRow("DTD without entities") << "<!DOCTYPE R><R/>";
-        QTest::newRow("DTD with internal subset")
-            << "<!DOCTYPE R [<!ELEMENT R (#PCDATA)>]><R>x</R>";
         QTest::newRow("external entity")
             << "<!DOCTYPE R [<!ENTITY x SYSTEM 'file:///etc/passwd'>]><R>&x;</R>";
         QTest::newRow("entity bomb") << "<!DOCTYPE R [<!ENTITY e \"" + QString(4000, u'x') +
                                             "\">]><R>" + QStringLiteral("&e;").repeated(400000) +
                                             "</R>";
-        QTest::newRow("depth 257") << nested(AlarmSearchLimits::MaxDepth + 1);
         QTest::newRow("depth 100000") << nested(100000);
         QTest::newRow("depth 100000 unclosed") << QString(QStringLiteral("<e>")).repeated(100000);
     }
@@ -167,15 +140,12 @@ private slots:
         QFETCH(QString, xml);
         XML2Json converter;
         QVERIFY(converter.parse(QStringLiteral("<ok/>")).isValid());
-        const QVariant result = converter.parse(xml);
-        QVERIFY(!result.isValid());
+        QVERIFY(!converter.parse(xml).isValid());
         QVERIFY(!converter.errorString().isEmpty());
     }
 
     void depthBound()
     {
-        const QVariant deepest = XML2Json().parse(nested(AlarmSearchLimits::MaxDepth));
-        QCOMPARE(depthOf(deepest), AlarmSearchLimits::MaxDepth);
         XML2Json converter;
         QVERIFY(!converter.parse(nested(AlarmSearchLimits::MaxDepth + 1)).isValid());
         QVERIFY(converter.errorString().contains(QLatin1String("256")));

@@ -25,7 +25,7 @@ inline ORVOSrvTunnelControl::QueryAlarmCompletion recordQuery(ReaderOutcome& out
 inline ORVOSrvTunnelControl::ReplyCompletion recordReply(ReaderOutcome& out)
 {
     return [&out](bool ok, bool isLast, const QVariant& result, const QString& relay) {
-        out = {out.calls + 1, ok, isLast, result, QString(), relay};
+        recordQuery(out)(ok, isLast, result, QString(), relay);
     };
 }
 
@@ -38,17 +38,9 @@ inline ReaderOutcome readReply(Reader reader, const FakeTunnelClient::Reply& r)
     if (reader == Reader::Query)
         ORVOSrvTunnelControl::queryAlarmCB(r.ok, r.relayPath, r.statusText, r.replyText, r.isLast,
                                            recordQuery(out));
-    else if (reader == Reader::Process)
-        ORVOSrvTunnelControl::processAlarmCB(r.ok, r.relayPath, r.statusText, r.replyText, r.isLast,
-                                             recordReply(out));
     else
-        ORVOSrvTunnelControl::getAlarmInfoCB(r.ok, r.relayPath, r.statusText, r.replyText, r.isLast,
-                                             recordReply(out));
+        (reader == Reader::Process ? ORVOSrvTunnelControl::processAlarmCB
+                                   : ORVOSrvTunnelControl::getAlarmInfoCB)(
+            r.ok, r.relayPath, r.statusText, r.replyText, r.isLast, recordReply(out));
     return out;
-}
-
-// The alarm-list reader on an accepted exchange.
-inline ReaderOutcome readAlarmList(const QString& replyText)
-{
-    return readReply(Reader::Query, {true, QString(), QStringLiteral("0"), replyText, true});
 }
