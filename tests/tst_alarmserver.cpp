@@ -148,31 +148,18 @@ private slots:
                     << ""
                     << "" << fieldsMatch(patterns);
             };
-        const auto events = [](const QString& fragment) {
-            return u"<TriggerEventList>%1</TriggerEventList>"_s.arg(fragment);
-        };
-        row("camera filter", events(CAMERA_TRIGGER_EVENT_FILTER_STRING),
+        // One row per rule; the default query's empty event list covers an empty list.
+        row("events",
+            u"<TriggerEventList>%1</TriggerEventList>"_s.arg(CAMERA_TRIGGER_EVENT_FILTER_STRING),
             {{"EventClass", "CamEvent|VCA|CamConn|RecStatus|RecErr"}});
-        row("system filter", events(SYSTEM_TRIGGER_EVENT_FILTER_STRING),
-            {{"SubEvent", ""},
-             {"EventClass", "StationConn|StorageConn|StorageCapacity|SysLicense|SysNetwork|"
-                            "SysVirMem|FanStatus|GpsConn|GpsSpeed|Gsensor|SysVcaAreaReport|"
-                            "BruteForceAttack|CyberAttack|QuarantineEvent"}});
-        row("external device filter", events(EXTERNAL_DEVICE_TRIGGER_EVENT_FILTER_STRING),
-            {{"EventClass", "ExtIODevice|DIOStatus|ExtTCPMessage|ExtDataMagnet|ExtAccessRule|"
-                            "VirtualTrigger|ManualEvent"}});
         row("states",
             u"<AlarmStateList><State>Processing</State><State>FalseAlarm</State>"
             "</AlarmStateList>"_s,
             {{"State", "Processing|FalseAlarm"}});
-        row("empty state list", u"<AlarmStateList/>"_s, {});
-        row("percent-encoded name, any case",
-            u"<NameList><Name>LINE%20crossing</Name><Name>Intrusion%20at</Name></NameList>"_s,
-            {{"AlarmName", ".*(Line Crossing|Intrusion at).*"}});
-        row("two name lists must both hold",
-            u"<NameList><Name>Motion</Name><Name>Loitering</Name></NameList>"
-            "<NameList><Name>Parking</Name></NameList>"_s,
-            {{"AlarmName", "(?=.*(Motion|Loitering)).*Parking.*"}});
+        row("name lists all hold, percent-encoded, any case",
+            u"<NameList><Name>LINE%20crossing</Name><Name>mOTION</Name></NameList>"
+            "<NameList><Name>parking</Name></NameList>"_s,
+            {{"AlarmName", "(?=.*(Line Crossing|Motion)).*Parking.*"}});
         row("device names, any case, whole name",
             u"<TriggerDeviceNameList><DeviceName>lobby ENTRANCE</DeviceName><DeviceName>Recording "
             "Server 01</DeviceName><DeviceName>Server</DeviceName></TriggerDeviceNameList>"_s,
@@ -279,9 +266,6 @@ private slots:
         QCOMPARE(info(*m_server, first, u"Alarm"_s).first()["State"], u"Handled"_s);
         QCOMPARE(info(*m_server, first, u"Entry"_s).last()["Note"], u"second look"_s);
 
-        const CommandReply unknown =
-            m_server->execute(u"GetAlarmInfo"_s, infoCommand(u"A9999999"_s));
-        QCOMPARE(unknown.statusText + unknown.replyText, u"80000004"_s);
         m_all = query(*m_server, queryCommand());
     }
 
@@ -318,7 +302,6 @@ private slots:
                                 << QString::fromLatin1(status);
         };
         row("not XML", "QryAlarmList", u"<QryAlarmList><Filters>"_s);
-        row("empty", "GetAlarmInfo", QString());
         row("root of another command", "GetAlarmInfo",
             u"<MuteAlarm><Mute>false</Mute></MuteAlarm>"_s);
         row("DTD", "GetAlarmInfo",
@@ -408,7 +391,6 @@ private slots:
         QTest::newRow("two frames at once") << first + second << 2 << 0 << true;
         QTest::newRow("frame and a half") << first + second.left(7) << 1 << 7 << true;
         QTest::newRow("header only") << first.left(3) << 0 << 3 << true;
-        QTest::newRow("all but one byte") << first.chopped(1) << 0 << first.size() - 1 << true;
         QTest::newRow("too long") << first + huge << 1 << 4 << false;
         QTest::newRow("not an object") << array + "[]" << 0 << 6 << false;
         QTest::newRow("not JSON") << first + encodeFrame({}).left(4) + "{x" << 1 << 6 << false;
