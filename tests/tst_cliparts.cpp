@@ -28,42 +28,6 @@ QVariantMap alarm(int id, const QDateTime& time)
         {u"ServerTime"_s, time.toString(u"yyyy-MM-ddTHH:mm:ss"_s) + QLatin1Char('Z')}};
 }
 
-// A server stand-in with the real one's search rules: inclusive time bounds, newest first,
-// at most AlarmSearchLimits::MaxRecords; ties in time come back in an arbitrary but fixed order.
-class FakeAlarmStore
-{
-public:
-    explicit FakeAlarmStore(QList<QVariantMap> alarms) : m_alarms(std::move(alarms))
-    {
-        std::stable_sort(m_alarms.begin(), m_alarms.end(), [](const auto& a, const auto& b) {
-            return a.value(u"ServerTime"_s).toString() > b.value(u"ServerTime"_s).toString();
-        });
-    }
-    bool search(const QVariantMap& args, QVariantList* page, QString*)
-    {
-        ++searches;
-        const QString end = ignoresWindow ? QString() : args.value(ARG_END_TIME).toString();
-        page->clear();
-        for (const QVariantMap& alarm : std::as_const(m_alarms)) {
-            const QString time = alarm.value(u"ServerTime"_s).toString().chopped(1); // drop "Z"
-            if (!end.isEmpty() && time > end)
-                continue;
-            if (page->size() == AlarmSearchLimits::MaxRecords)
-                break;
-            page->append(alarm);
-        }
-        if (oldestFirst)
-            std::reverse(page->begin(), page->end());
-        return true;
-    }
-    int searches = 0;
-    bool oldestFirst = false; // misbehaving servers
-    bool ignoresWindow = false;
-
-private:
-    QList<QVariantMap> m_alarms;
-};
-
 } // namespace
 
 class TestCliParts : public QObject
@@ -76,35 +40,30 @@ private slots:
         QTest::addColumn<QString>("text");
         QTest::addColumn<bool>("isEnd");
         QTest::addColumn<QString>("zone");
-        QTest::addColumn<QString>("expected"); // empty: rejected
-        const QString utc = u"UTC"_s;
-        const QString berlin = u"Europe/Berlin"_s;
-        QTest::newRow("full") << "2026-11-01T08:15:30" << false << utc << "2026-11-01T08:15:30";
-        QTest::newRow("Z") << "2026-11-01T08:15:30Z" << true << berlin << "2026-11-01T08:15:30";
-        QTest::newRow("offset") << "2026-11-01T08:15:30+02:00" << false << utc
-                                << "2026-11-01T06:15:30";
-        QTest::newRow("offset without colon")
-            << "2026-11-01T08:15-0130" << false << berlin << "2026-11-01T09:45:00";
-        QTest::newRow("fraction") << "2026-11-01T08:15:30.987Z" << true << utc
-                                  << "2026-11-01T08:15:30";
-        QTest::newRow("blank, minutes, start")
-            << "2026-11-01 08:15" << false << utc << "2026-11-01T08:15:00";
-        QTest::newRow("blank, minutes, end")
-            << "2026-11-01 08:15" << true << utc << "2026-11-01T08:15:59";
-        QTest::newRow("naive in zone")
-            << "2026-07-01 08:15:30" << false << berlin << "2026-07-01T06:15:30";
-        QTest::newRow("date as start") << "2026-11-01" << false << utc << "2026-11-01T00:00:00";
-        QTest::newRow("date as end") << "2026-11-01" << true << utc << "2026-11-01T23:59:59";
-        QTest::newRow("date in zone") << "2026-11-01" << false << berlin << "2026-10-31T23:00:00";
-        QTest::newRow("hours ago") << "24h" << false << berlin << "2026-11-19T12:00:00";
-        QTest::newRow("weeks ago") << "2w" << false << utc << "2026-11-06T12:00:00";
-        QTest::newRow("minutes ago") << "90m" << true << utc << "2026-11-20T10:30:00";
-        QTest::newRow("now") << "NOW" << true << utc << "2026-11-20T12:00:00";
-        QTest::newRow("unknown unit") << "3y" << false << utc << "";
-        QTest::newRow("impossible date") << "2026-02-30" << false << utc << "";
-        QTest::newRow("impossible hour") << "2026-11-01T25:00" << false << utc << "";
-        QTest::newRow("bad offset") << "2026-11-01T08:15+25:00" << false << utc << "";
-        QTest::newRow("words") << "yesterday" << false << utc << "";
+        QTest::addColumn<QString>("expected");
+        // Name, text, 'S'tart or 'E'nd bound, zone of naive times, result (empty: rejected).
+        const auto row = [](const char* name, const char* text, char bound, const char* zone,
+                            const char* expected) {
+            QTest::newRow(name) << text << (bound == 'E') << zone << expected;
+        };
+        const char* berlin = "Europe/Berlin";
+        row("Z", "2026-11-01T08:15:30Z", 'E', berlin, "2026-11-01T08:15:30");
+        row("offset", "2026-11-01T08:15:30+02:00", 'S', "UTC", "2026-11-01T06:15:30");
+        row("offset without colon", "2026-11-01T08:15-0130", 'S', berlin, "2026-11-01T09:45:00");
+        row("fraction", "2026-11-01T08:15:30.987Z", 'E', "UTC", "2026-11-01T08:15:30");
+        row("blank, minutes, start", "2026-11-01 08:15", 'S', "UTC", "2026-11-01T08:15:00");
+        row("blank, minutes, end", "2026-11-01 08:15", 'E', "UTC", "2026-11-01T08:15:59");
+        row("naive in zone", "2026-07-01 08:15:30", 'S', berlin, "2026-07-01T06:15:30");
+        row("date as end", "2026-11-01", 'E', "UTC", "2026-11-01T23:59:59");
+        row("date in zone", "2026-11-01", 'S', berlin, "2026-10-31T23:00:00");
+        row("weeks ago", "2w", 'S', "UTC", "2026-11-06T12:00:00");
+        row("minutes ago", "90m", 'E', "UTC", "2026-11-20T10:30:00");
+        row("now", "NOW", 'E', "UTC", "2026-11-20T12:00:00");
+        row("unknown unit", "3y", 'S', "UTC", "");
+        row("impossible date", "2026-02-30", 'S', "UTC", "");
+        row("impossible hour", "2026-11-01T25:00", 'S', "UTC", "");
+        row("bad offset", "2026-11-01T08:15+25:00", 'S', "UTC", "");
+        row("words", "yesterday", 'S', "UTC", "");
     }
 
     void times()
@@ -159,45 +118,44 @@ private slots:
         QCOMPARE(rebuilt, args);
         QVERIFY(!QueryArguments::filterOf({{ARG_STATE_FILTER, u"<Or/>"_s}}, &terms, &error));
 
-        QueryFilter groups;
-        groups.eventGroups = QStringList{u"System"_s, u"external"_s};
-        groups.unhandledOnly = true;
-        QVERIFY(QueryArguments::build(groups, kNow, &args, &error));
-        QCOMPARE(QueryArguments::method(groups), METHOD_QUERY_UNHANDLED_ALARM);
-        QCOMPARE(args,
-                 (QVariantMap{
-                     {ARG_TRIGGER_EVENT_FILTER, SYSTEM_TRIGGER_EVENT_FILTER_STRING +
-                                                    EXTERNAL_DEVICE_TRIGGER_EVENT_FILTER_STRING},
-                     {ARG_STATE_FILTER,
-                      u"<AlarmStateList><State>Unhandled</State></AlarmStateList>"_s}}));
+        QueryFilter unhandled;
+        unhandled.eventGroups = QStringList{u"System"_s, u"external"_s};
+        unhandled.unhandledOnly = true;
+        QVERIFY(QueryArguments::build(unhandled, kNow, &args, &error));
+        QCOMPARE(QueryArguments::method(unhandled), METHOD_QUERY_UNHANDLED_ALARM);
+        QCOMPARE(args, (QVariantMap{{ARG_TRIGGER_EVENT_FILTER,
+                                     SYSTEM_TRIGGER_EVENT_FILTER_STRING +
+                                         EXTERNAL_DEVICE_TRIGGER_EVENT_FILTER_STRING},
+                                    {ARG_STATE_FILTER, u"<AlarmStateList><State>Unhandled</State>"
+                                                       "</AlarmStateList>"_s}}));
     }
 
     void badQueryArguments_data()
     {
         QTest::addColumn<QueryFilter>("filter");
         QTest::addColumn<QString>("error");
-        const auto events = [](const QString& event) {
+        const auto row = [](const char* name, const char* error, void (*set)(QueryFilter&)) {
             QueryFilter filter;
-            filter.events = QStringList{event};
-            return filter;
+            set(filter);
+            QTest::newRow(name) << filter << error;
         };
-        QTest::newRow("sub-event of a class without")
-            << events(u"StationConn:Lost"_s) << "StationConn has no sub-events";
-        QTest::newRow("no class") << events(u":Motion"_s) << "expected CLASS or CLASS:SUBEVENT";
-        QTest::newRow("unknown sub-event")
-            << events(u"VCA:Motion"_s)
-            << "sub-event \"Motion\" of VCA (expected one of LineDetection, FieldDetection";
-        QueryFilter filter;
-        filter.eventGroups = QStringList{u"cameras"_s};
-        QTest::newRow("unknown group") << filter << "unknown event group";
-        filter = QueryFilter();
-        filter.unhandledOnly = true;
-        filter.states = QStringList{u"Handled"_s};
-        QTest::newRow("unhandled with another state") << filter << "--unhandled";
-        filter = QueryFilter();
-        filter.from = u"2026-11-02"_s;
-        filter.to = u"2026-11-01"_s;
-        QTest::newRow("from after to") << filter << "is after --to";
+        row("sub-event of a class without", "StationConn has no sub-events",
+            [](QueryFilter& f) { f.events = {u"StationConn:Lost"_s}; });
+        row("no class", "expected CLASS or CLASS:SUBEVENT",
+            [](QueryFilter& f) { f.events = {u":Motion"_s}; });
+        row("unknown sub-event",
+            "sub-event \"Motion\" of VCA (expected one of LineDetection, FieldDetection",
+            [](QueryFilter& f) { f.events = {u"VCA:Motion"_s}; });
+        row("unknown group", "unknown event group",
+            [](QueryFilter& f) { f.eventGroups = {u"cameras"_s}; });
+        row("unhandled with another state", "--unhandled", [](QueryFilter& f) {
+            f.unhandledOnly = true;
+            f.states = {u"Handled"_s};
+        });
+        row("from after to", "is after --to", [](QueryFilter& f) {
+            f.from = u"2026-11-02"_s;
+            f.to = u"2026-11-01"_s;
+        });
     }
 
     void badQueryArguments()
@@ -234,14 +192,25 @@ private slots:
         QFETCH(int, perSecond);
         QFETCH(int, expectedSearches);
         QFETCH(int, misbehaviour);
-        QList<QVariantMap> alarms;
+        // A server stand-in with the real one's rules: inclusive end, newest first, at most
+        // MaxRecords; misbehaving ones list oldest first (1) or ignore the window (2).
+        QVariantList alarms;
         for (int i = 0; i < alarmCount; ++i)
             alarms.append(alarm(i + 1, kNow.addSecs(-(i / perSecond))));
-        FakeAlarmStore store(alarms);
-        store.oldestFirst = misbehaviour == 1;
-        store.ignoresWindow = misbehaviour == 2;
-        AlarmPager pager([&store](const QVariantMap& args, QVariantList* page, QString* error) {
-            return store.search(args, page, error);
+        int searches = 0;
+        AlarmPager pager([&](const QVariantMap& args, QVariantList* page, QString*) {
+            ++searches;
+            const QString end = misbehaviour == 2 ? QString() : args.value(ARG_END_TIME).toString();
+            const auto newer = [&end](const QVariant& a) {
+                return !end.isEmpty() &&
+                       a.toMap().value(u"ServerTime"_s).toString().chopped(1) > end;
+            };
+            const auto first = std::find_if_not(alarms.cbegin(), alarms.cend(), newer);
+            *page = QVariantList(first, first + std::min<qsizetype>(alarms.cend() - first,
+                                                                    AlarmSearchLimits::MaxRecords));
+            if (misbehaviour == 1)
+                std::reverse(page->begin(), page->end());
+            return true;
         });
         QVariantList found;
         QString error;
@@ -252,7 +221,7 @@ private slots:
                 return true;
             },
             &error);
-        QCOMPARE(store.searches, expectedSearches);
+        QCOMPARE(searches, expectedSearches);
         if (misbehaviour) {
             QVERIFY(!ok);
             QCOMPARE(error, u"the server's alarms are not newest first within the searched time "
@@ -380,62 +349,54 @@ private slots:
         QTest::addColumn<QByteArray>("line");
         QTest::addColumn<QVariantMap>("args"); // expected; empty with an error
         QTest::addColumn<QString>("error");
-        const auto row = [](const char* name, const char* line, const QVariantMap& args,
-                            const char* error = "") {
-            QTest::newRow(name) << QByteArray(line) << args << QString::fromUtf8(error);
+        // Name, method, the members of "args", the expected map or the error's start.
+        const auto row = [](const char* name, const char* method, const char* args,
+                            const QVariantMap& expected, const char* error = "") {
+            QTest::newRow(name) << "{\"method\":\"" + QByteArray(method) + "\",\"args\":{" + args +
+                                       "}}"
+                                << expected << QString::fromUtf8(error);
         };
-        row("friendly search",
-            R"({"method":"QryAlarmList","args":{"stateFilter":["unhandled","false-alarm"],)"
-            R"("triggerEventFilter":["camevent:motion","system"],"startTime":"2026-11-01 08:00",)"
-            R"("endTime":"24h","all":true}})",
-            {{ARG_STATE_FILTER, QStringLiteral("<AlarmStateList><State>Unhandled</State>"
-                                               "<State>FalseAlarm</State></AlarmStateList>")},
-             {ARG_TRIGGER_EVENT_FILTER, QStringLiteral("<Event CameraEvent=\"Motion\">CamEvent"
-                                                       "</Event>") +
+        const QStringList a1{u"A1"_s};
+        row("friendly search", "QryAlarmList",
+            R"("stateFilter":["unhandled","false-alarm"],"triggerEventFilter":["camevent:motion",)"
+            R"("system"],"startTime":"2026-11-01 08:00","endTime":"24h","all":true)",
+            {{ARG_STATE_FILTER, u"<AlarmStateList><State>Unhandled</State>"
+                                "<State>FalseAlarm</State></AlarmStateList>"_s},
+             {ARG_TRIGGER_EVENT_FILTER, u"<Event CameraEvent=\"Motion\">CamEvent</Event>"_s +
                                             SYSTEM_TRIGGER_EVENT_FILTER_STRING},
              {ARG_START_TIME, u"2026-11-01T08:00:00"_s},
              {ARG_END_TIME, u"2026-11-19T12:00:00"_s}});
-        row("raw fragments",
-            R"({"method":"QryUnhandledAlarm","args":{"stateFilter":"<AlarmStateList/>",)"
-            R"("rules":[{"type":1,"tagList":["Dock"]}]}})",
+        row("raw fragments", "QryUnhandledAlarm",
+            R"("stateFilter":"<AlarmStateList/>","rules":[{"type":1,"tagList":["Dock"]}])",
             {{ARG_STATE_FILTER, u"<AlarmStateList/>"_s},
              {ARG_RULES,
               QVariantList{QVariantMap{{u"type"_s, 1}, {u"tagList"_s, QStringList{u"Dock"_s}}}}}});
-        row("update",
-            R"({"method":"UpdateAlarm","args":{"alarmIdList":"A1","alarmStatus":"handled"}})",
-            {{ARG_ALARM_ID_LIST, QStringList{u"A1"_s}}, {ARG_ALARM_STATUS, u"Handled"_s}});
-        row("mute",
-            R"({"method":"MuteAlarm","args":{"alarmIdList":["A1"],"isMute":true,"muteTimeSecond":60}})",
-            {{ARG_ALARM_ID_LIST, QStringList{u"A1"_s}},
-             {ARG_IS_MUTE, true},
-             {ARG_MUTE_TIME_SECOND, 60}});
-        row("unknown key", R"({"method":"QryAlarmList","args":{"from":"7d","bogus":1}})", {},
+        row("update", "UpdateAlarm", R"("alarmIdList":"A1","alarmStatus":"handled")",
+            {{ARG_ALARM_ID_LIST, a1}, {ARG_ALARM_STATUS, u"Handled"_s}});
+        row("mute", "MuteAlarm", R"("alarmIdList":["A1"],"isMute":true,"muteTimeSecond":60)",
+            {{ARG_ALARM_ID_LIST, a1}, {ARG_IS_MUTE, true}, {ARG_MUTE_TIME_SECOND, 60}});
+        row("unknown key", "QryAlarmList", R"("from":"7d","bogus":1)", {},
             "args.bogus: unknown key for QryAlarmList (expected triggerEventFilter, stateFilter, "
             "startTime, endTime, rules, relayPath, all)");
-        row("unknown top key", R"({"method":"QryAlarmList","argz":{}})", {},
-            "unknown key \"argz\"");
-        row("all on a history",
-            R"({"method":"GetAlarmHistory","args":{"alarmId":"A1","all":true}})", {},
-            "args.all: unknown key for GetAlarmHistory");
-        row("unknown state", R"({"method":"QryAlarmList","args":{"stateFilter":"Closed"}})", {},
+        QTest::newRow("unknown top key") << QByteArray(R"({"method":"QryAlarmList","argz":{}})")
+                                         << QVariantMap() << u"unknown key \"argz\""_s;
+        row("unknown state", "QryAlarmList", R"("stateFilter":"Closed")", {},
             "args.stateFilter: unknown state \"Closed\"");
-        row("unknown event", R"({"method":"QryAlarmList","args":{"triggerEventFilter":["Bogus"]}})",
-            {}, "args.triggerEventFilter: unknown event class \"Bogus\"");
-        row("time as number", R"({"method":"QryAlarmList","args":{"endTime":5}})", {},
+        row("unknown event", "QryAlarmList", R"("triggerEventFilter":["Bogus"])", {},
+            "args.triggerEventFilter: unknown event class \"Bogus\"");
+        row("time as number", "QryAlarmList", R"("endTime":5)", {},
             "args.endTime: expected a time text");
-        row("mute flag as text",
-            R"({"method":"MuteAlarm","args":{"alarmIdList":["A1"],"isMute":"yes"}})", {},
+        row("mute flag as text", "MuteAlarm", R"("alarmIdList":["A1"],"isMute":"yes")", {},
             "args.isMute: expected true or false");
-        row("fractional seconds",
-            R"({"method":"MuteAlarm","args":{"alarmIdList":["A1"],"isMute":true,"muteTimeSecond":1.5}})",
-            {}, "args.muteTimeSecond: expected a whole number");
-        row("ids as number",
-            R"({"method":"UpdateAlarm","args":{"alarmIdList":[1],"alarmStatus":"Handled"}})", {},
+        row("fractional seconds", "MuteAlarm",
+            R"("alarmIdList":["A1"],"isMute":true,"muteTimeSecond":1.5)", {},
+            "args.muteTimeSecond: expected a whole number");
+        row("ids as number", "UpdateAlarm", R"("alarmIdList":[1],"alarmStatus":"Handled")", {},
             "args.alarmIdList: expected a text or a list of texts");
-        row("missing state", R"({"method":"UpdateAlarm","args":{"alarmIdList":["A1"]}})", {},
+        row("missing state", "UpdateAlarm", R"("alarmIdList":["A1"])", {},
             "args.alarmStatus: required for UpdateAlarm");
-        row("bad rule", R"({"method":"QryAlarmList","args":{"rules":[{"type":2,"tagList":[]}]}})",
-            {}, "args.rules: expected a list of");
+        row("bad rule", "QryAlarmList", R"("rules":[{"type":2,"tagList":[]}])", {},
+            "args.rules: expected a list of");
     }
 
     void batchRequests()
