@@ -349,18 +349,16 @@ private slots:
         QAtomicInt failures;
         std::vector<std::unique_ptr<QThread>> threads;
         for (int t = 0; t < 4; ++t) {
-            threads
-                .emplace_back(QThread::create([&server, &failures, t] {
-                    for (int i = 1 + t * 10; i <= 10 + t * 10; ++i) {
-                        const QString id = u"A%1"_s.arg(i, 7, 10, QChar('0'));
-                        failures += !server
-                                         ->execute(u"ProcessAlarm"_s,
-                                                   processCommand({id}, u"Processing"_s, u"done"_s))
-                                         .replyText.contains("<Code>0</Code>"_L1) ||
-                                    query(*server, queryCommand()).size() != 200;
-                    }
-                }))
-                ->start();
+            threads.emplace_back(QThread::create([&server, &failures, t] {
+                for (int i = 1 + t * 10; i <= 10 + t * 10; ++i) {
+                    const QString command = processCommand({u"A%1"_s.arg(i, 7, 10, QChar('0'))},
+                                                           u"Processing"_s, u"done"_s);
+                    const CommandReply reply = server->execute(u"ProcessAlarm"_s, command);
+                    failures += !reply.replyText.contains("<Code>0</Code>"_L1) ||
+                                query(*server, queryCommand()).size() != 200;
+                }
+            }));
+            threads.back()->start();
         }
         for (auto& thread : threads)
             QVERIFY(thread->wait());

@@ -229,18 +229,9 @@ private slots:
             return;
         }
         QVERIFY(ok);
+        // Every alarm once, newest first; more than a page in one second ends at the first page.
         const bool oneSecond = perSecond > AlarmSearchLimits::MaxRecords;
-        QCOMPARE(found.size(), oneSecond ? AlarmSearchLimits::MaxRecords : alarmCount);
-        QSet<QString> ids;
-        QString previousTime = u"9999"_s;
-        for (const QVariant& entry : std::as_const(found)) {
-            const QVariantMap fields = entry.toMap();
-            ids.insert(fields.value(u"AlarmID"_s).toString());
-            const QString time = fields.value(u"ServerTime"_s).toString();
-            QVERIFY(time <= previousTime);
-            previousTime = time;
-        }
-        QCOMPARE(ids.size(), found.size());
+        QCOMPARE(found, alarms.mid(0, oneSecond ? AlarmSearchLimits::MaxRecords : alarmCount));
         QCOMPARE(pager.warning().contains(u"may be missing"_s), oneSecond);
     }
 
@@ -273,10 +264,9 @@ private slots:
         ExportWriter writer(options);
         const QByteArray bytes = writer.begin() + writer.alarm(ExportedAlarm{fields, history}) +
                                  writer.alarm(ExportedAlarm{fields, QVariantList()}) + writer.end();
-        QVERIFY(bytes.startsWith("\xEF\xBB\xBF"
-                                 "AlarmID,"));
-        const QString csv = QString::fromUtf8(bytes.mid(3));
-        const QStringList rows = csv.split(u"\r\n"_s, Qt::SkipEmptyParts);
+        QVERIFY(bytes.startsWith("\xEF\xBB\xBF"));
+        const QStringList rows =
+            QString::fromUtf8(bytes.mid(3)).split(u"\r\n"_s, Qt::SkipEmptyParts);
         QCOMPARE(rows.size(), 4);
         QCOMPARE(rows[0], ExportWriter::csvColumns().join(u','));
         const QString alarm = QStringLiteral("A0000001,,,,\"Gate, \"\"north\"\"\",,,"
