@@ -64,15 +64,11 @@ QList<AlarmFields> query(AlarmServer& server, const QString& command)
     return elementsOf(server.execute(u"QryAlarmList"_s, command).replyText, u"Alarm"_s);
 }
 
-QString infoCommand(const QString& id)
-{
-    return u"<GetAlarmInfo><AlarmID>%1</AlarmID></GetAlarmInfo>"_s.arg(id);
-}
-
 // The children of every element called tag in the alarm's GetAlarmInfo reply.
 QList<AlarmFields> info(AlarmServer& server, const QString& id, const QString& tag)
 {
-    return elementsOf(server.execute(u"GetAlarmInfo"_s, infoCommand(id)).replyText, tag);
+    const QString command = u"<GetAlarmInfo><AlarmID>%1</AlarmID></GetAlarmInfo>"_s.arg(id);
+    return elementsOf(server.execute(u"GetAlarmInfo"_s, command).replyText, tag);
 }
 
 QString processCommand(const QStringList& ids, const QString& state, const QString& note)
@@ -140,14 +136,12 @@ private slots:
 
         // Name, the filters (after an empty event list unless they start with one), full-match
         // patterns of the fields of every alarm listed.
-        const auto row =
-            [](const char* name, const QString& filters,
-               const QList<QPair<const char*, QString>>& patterns) {
-                QTest::newRow(name)
-                    << (filters.startsWith("<Trigger"_L1) ? "" : "<TriggerEventList/>") + filters
-                    << ""
-                    << "" << fieldsMatch(patterns);
-            };
+        const auto row = [](const char* name, const QString& filters,
+                            const QList<QPair<const char*, QString>>& patterns) {
+            const QString all =
+                filters.startsWith("<Trigger"_L1) ? filters : "<TriggerEventList/>" + filters;
+            QTest::newRow(name) << all << QString() << QString() << fieldsMatch(patterns);
+        };
         // One row per rule; the default query's empty event list covers an empty list.
         row("events",
             u"<TriggerEventList>%1</TriggerEventList>"_s.arg(CAMERA_TRIGGER_EVENT_FILTER_STRING),
@@ -211,10 +205,9 @@ private slots:
     {
         const QList<AlarmFields> alarms = query(*openServer(u":memory:"_s, 5200), queryCommand());
         QCOMPARE(alarms.size(), 5000);
-        for (int i = 1; i < alarms.size(); ++i) {
+        for (int i = 1; i < alarms.size(); ++i)
             QVERIFY(std::make_pair(alarms[i]["ServerTime"], alarms[i]["AlarmID"]) <
                     std::make_pair(alarms[i - 1]["ServerTime"], alarms[i - 1]["AlarmID"]));
-        }
     }
 
     // The demo alarms: the same seed seeds the same alarms, which cover every event of the three
@@ -384,14 +377,13 @@ private slots:
         const QByteArray second = encodeFrame({{"id", 2}});
         QByteArray huge(4, '\0');
         qToBigEndian(kMaxFramePayload + 1, huge.data());
-        QByteArray array(4, '\0');
-        qToBigEndian(quint32(2), array.data());
+        const QByteArray twoBytes = encodeFrame({}).left(4); // the header of "{}"
         QTest::newRow("two frames at once") << first + second << 2 << 0 << true;
         QTest::newRow("frame and a half") << first + second.left(7) << 1 << 7 << true;
         QTest::newRow("header only") << first.left(3) << 0 << 3 << true;
         QTest::newRow("too long") << first + huge << 1 << 4 << false;
-        QTest::newRow("not an object") << array + "[]" << 0 << 6 << false;
-        QTest::newRow("not JSON") << first + encodeFrame({}).left(4) + "{x" << 1 << 6 << false;
+        QTest::newRow("not an object") << twoBytes + "[]" << 0 << 6 << false;
+        QTest::newRow("not JSON") << first + twoBytes + "{x" << 1 << 6 << false;
     }
 
     void framing()
