@@ -81,9 +81,8 @@ QString processCommand(const QStringList& ids, const QString& state, const QStri
 QString muteCommand(const QStringList& ids, bool mute, int seconds)
 {
     return u"<MuteAlarm><EventTimecardIDList><ID>%1</ID></EventTimecardIDList><Mute>%2</Mute>"
-           "<MuteInterval>%3</MuteInterval></MuteAlarm>"_s
-               .arg(ids.join(u"</ID><ID>"_s), mute ? u"true"_s : u"false"_s)
-               .arg(seconds);
+           "<MuteInterval>%3</MuteInterval></MuteAlarm>"_s.arg(
+               ids.join(u"</ID><ID>"_s), QVariant(mute).toString(), QString::number(seconds));
 }
 
 std::unique_ptr<AlarmServer> openServer(const QString& path, int seedCount)
@@ -291,8 +290,7 @@ private slots:
             attributes += u" a%1=''"_s.arg(i);
         const auto row = [](const char* name, const char* method, const QString& command,
                             const char* status = "80000001") {
-            QTest::newRow(name) << QString::fromLatin1(method) << command
-                                << QString::fromLatin1(status);
+            QTest::newRow(name) << method << command << status;
         };
         row("not XML", "QryAlarmList", u"<QryAlarmList><Filters>"_s);
         row("root of another command", "GetAlarmInfo",
