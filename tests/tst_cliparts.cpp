@@ -71,8 +71,7 @@ private slots:
         QFETCH(bool, isEnd);
         QFETCH(QString, zone);
         QFETCH(QString, expected);
-        QString time;
-        QString error;
+        QString time, error;
         const bool ok =
             TimeArgument::parse(text, isEnd ? TimeArgument::Bound::End : TimeArgument::Bound::Start,
                                 kNow, TimeArgument::zoneNamed(zone), &time, &error);
@@ -278,7 +277,6 @@ private slots:
         QCOMPARE(ExportWriter::csvField(u"\rx"_s, true), u"\"\rx\""_s);
     }
 
-    // Compact and indented, with and without alarms: one JSON answer.
     void searchWriterStreamsOneAnswer()
     {
         for (const bool pretty : {false, true}) {
@@ -335,7 +333,7 @@ private slots:
         const QStringList a1{u"A1"_s};
         row("friendly search", "QryAlarmList",
             R"("stateFilter":["unhandled","false-alarm"],"triggerEventFilter":["camevent:motion",)"
-            R"("system"],"startTime":"2026-11-01 08:00","endTime":"24h","all":true)",
+            R"("System"],"startTime":"2026-11-01 08:00","endTime":"24h","all":true)",
             {{ARG_STATE_FILTER, u"<AlarmStateList><State>Unhandled</State>"
                                 "<State>FalseAlarm</State></AlarmStateList>"_s},
              {ARG_TRIGGER_EVENT_FILTER, u"<Event CameraEvent=\"Motion\">CamEvent</Event>"_s +
@@ -356,6 +354,8 @@ private slots:
             "startTime, endTime, rules, relayPath, all)");
         QTest::newRow("unknown top key") << QByteArray(R"({"method":"QryAlarmList","argz":{}})")
                                          << QVariantMap() << u"unknown key \"argz\""_s;
+        row("all on a history", "GetAlarmHistory", R"("alarmId":"A1","all":true)", {},
+            "args.all: unknown key for GetAlarmHistory");
         row("unknown state", "QryAlarmList", R"("stateFilter":"Closed")", {},
             "args.stateFilter: unknown state \"Closed\"");
         row("unknown event", "QryAlarmList", R"("triggerEventFilter":["Bogus"])", {},
