@@ -93,6 +93,7 @@ private slots:
         QVariantMap args;
         QString error;
         QVERIFY2(QueryArguments::build(filter, kNow, &args, &error), qPrintable(error));
+        QCOMPARE(QueryArguments::method(filter), METHOD_QUERY_ALARM_LIST);
         const auto rule = [](int type, const QStringList& tags) {
             return QVariantMap{{u"type"_s, type}, {u"tagList"_s, tags}};
         };
@@ -299,8 +300,7 @@ private slots:
         QVariantMap wide = alarm(1, kNow);
         wide.insert(u"AlarmName"_s, u"正門の動き検知 🚨 at the main gate"_s);
         wide.insert(u"Note"_s, u"Cafe\u0301 checked, all fine"_s);
-        QVariantMap plain = alarm(2, kNow.addSecs(-60));
-        plain.insert(u"AlarmName"_s, u"Motion"_s);
+        const QVariantMap plain = alarm(2, kNow.addSecs(-60));
         QCOMPARE(AlarmTable::displayWidth(u"正門🚨e\u0301"_s), 7);
         AlarmTable table(TimeArgument::zoneNamed(u"+01:00"_s), 72);
         const QStringList lines =
