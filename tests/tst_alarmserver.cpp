@@ -215,10 +215,9 @@ private slots:
     void seededAlarms()
     {
         QCOMPARE(query(*openServer(u":memory:"_s, 400), queryCommand()), m_all);
-        QSet<QString> events;
+        QSet<QStringList> events;
         for (const AlarmFields& alarm : std::as_const(m_all)) {
-            events.insert(alarm["EventClass"] + '/' + alarm["SubEventType"] + '/' +
-                          alarm["SubEvent"]);
+            events.insert({alarm["EventClass"], alarm["SubEventType"], alarm["SubEvent"]});
             const QList<AlarmFields> entries = info(*m_server, alarm["AlarmID"], u"Entry"_s);
             QVERIFY(!entries.isEmpty());
             QCOMPARE(entries.first(), (AlarmFields{{"Time", alarm["ServerTime"]},

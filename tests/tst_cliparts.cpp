@@ -306,6 +306,7 @@ private slots:
         const QStringList lines =
             table.page({wide, plain}).split(QLatin1Char('\n'), Qt::SkipEmptyParts);
         QCOMPARE(lines.size(), 3);
+        QVERIFY2(lines[0].startsWith(u"ALARM     TIME (UTC+01:00)     "_s), qPrintable(lines[0]));
         QVERIFY2(lines[2].startsWith(u"A0000002  2026-11-20 12:59:00  "_s), qPrintable(lines[2]));
         QVERIFY(lines[1].contains(u"…"_s));
         // MUTED starts at the same display column in every line, wide characters or not.
