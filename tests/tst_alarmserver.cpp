@@ -64,15 +64,11 @@ QList<AlarmFields> query(AlarmServer& server, const QString& command)
     return elementsOf(server.execute(u"QryAlarmList"_s, command).replyText, u"Alarm"_s);
 }
 
-QString infoCommand(const QString& id)
-{
-    return u"<GetAlarmInfo><AlarmID>%1</AlarmID></GetAlarmInfo>"_s.arg(id);
-}
-
 // The children of every element called tag in the alarm's GetAlarmInfo reply.
 QList<AlarmFields> info(AlarmServer& server, const QString& id, const QString& tag)
 {
-    return elementsOf(server.execute(u"GetAlarmInfo"_s, infoCommand(id)).replyText, tag);
+    const QString command = u"<GetAlarmInfo><AlarmID>%1</AlarmID></GetAlarmInfo>"_s.arg(id);
+    return elementsOf(server.execute(u"GetAlarmInfo"_s, command).replyText, tag);
 }
 
 QString processCommand(const QStringList& ids, const QString& state, const QString& note)
@@ -85,9 +81,8 @@ QString processCommand(const QStringList& ids, const QString& state, const QStri
 QString muteCommand(const QStringList& ids, bool mute, int seconds)
 {
     return u"<MuteAlarm><EventTimecardIDList><ID>%1</ID></EventTimecardIDList><Mute>%2</Mute>"
-           "<MuteInterval>%3</MuteInterval></MuteAlarm>"_s
-               .arg(ids.join(u"</ID><ID>"_s), mute ? u"true"_s : u"false"_s)
-               .arg(seconds);
+           "<MuteInterval>%3</MuteInterval></MuteAlarm>"_s.arg(
+               ids.join(u"</ID><ID>"_s), QVariant(mute).toString(), QString::number(seconds));
 }
 
 std::unique_ptr<AlarmServer> openServer(const QString& path, int seedCount)
@@ -140,39 +135,24 @@ private slots:
 
         // Name, the filters (after an empty event list unless they start with one), full-match
         // patterns of the fields of every alarm listed.
-        const auto row =
-            [](const char* name, const QString& filters,
-               const QList<QPair<const char*, QString>>& patterns) {
-                QTest::newRow(name)
-                    << (filters.startsWith("<Trigger"_L1) ? "" : "<TriggerEventList/>") + filters
-                    << ""
-                    << "" << fieldsMatch(patterns);
-            };
-        const auto events = [](const QString& fragment) {
-            return u"<TriggerEventList>%1</TriggerEventList>"_s.arg(fragment);
+        const auto row = [](const char* name, const QString& filters,
+                            const QList<QPair<const char*, QString>>& patterns) {
+            const QString all =
+                filters.startsWith("<Trigger"_L1) ? filters : "<TriggerEventList/>" + filters;
+            QTest::newRow(name) << all << QString() << QString() << fieldsMatch(patterns);
         };
-        row("camera filter", events(CAMERA_TRIGGER_EVENT_FILTER_STRING),
+        // One row per rule; the default query's empty event list covers an empty list.
+        row("events",
+            u"<TriggerEventList>%1</TriggerEventList>"_s.arg(CAMERA_TRIGGER_EVENT_FILTER_STRING),
             {{"EventClass", "CamEvent|VCA|CamConn|RecStatus|RecErr"}});
-        row("system filter", events(SYSTEM_TRIGGER_EVENT_FILTER_STRING),
-            {{"SubEvent", ""},
-             {"EventClass", "StationConn|StorageConn|StorageCapacity|SysLicense|SysNetwork|"
-                            "SysVirMem|FanStatus|GpsConn|GpsSpeed|Gsensor|SysVcaAreaReport|"
-                            "BruteForceAttack|CyberAttack|QuarantineEvent"}});
-        row("external device filter", events(EXTERNAL_DEVICE_TRIGGER_EVENT_FILTER_STRING),
-            {{"EventClass", "ExtIODevice|DIOStatus|ExtTCPMessage|ExtDataMagnet|ExtAccessRule|"
-                            "VirtualTrigger|ManualEvent"}});
         row("states",
             u"<AlarmStateList><State>Processing</State><State>FalseAlarm</State>"
             "</AlarmStateList>"_s,
             {{"State", "Processing|FalseAlarm"}});
-        row("empty state list", u"<AlarmStateList/>"_s, {});
-        row("percent-encoded name, any case",
-            u"<NameList><Name>LINE%20crossing</Name><Name>Intrusion%20at</Name></NameList>"_s,
-            {{"AlarmName", ".*(Line Crossing|Intrusion at).*"}});
-        row("two name lists must both hold",
-            u"<NameList><Name>Motion</Name><Name>Loitering</Name></NameList>"
-            "<NameList><Name>Parking</Name></NameList>"_s,
-            {{"AlarmName", "(?=.*(Motion|Loitering)).*Parking.*"}});
+        row("name lists all hold, percent-encoded, any case",
+            u"<NameList><Name>LINE%20crossing</Name><Name>mOTION</Name></NameList>"
+            "<NameList><Name>parking</Name></NameList>"_s,
+            {{"AlarmName", "(?=.*(Line Crossing|Motion)).*Parking.*"}});
         row("device names, any case, whole name",
             u"<TriggerDeviceNameList><DeviceName>lobby ENTRANCE</DeviceName><DeviceName>Recording "
             "Server 01</DeviceName><DeviceName>Server</DeviceName></TriggerDeviceNameList>"_s,
@@ -224,10 +204,9 @@ private slots:
     {
         const QList<AlarmFields> alarms = query(*openServer(u":memory:"_s, 5200), queryCommand());
         QCOMPARE(alarms.size(), 5000);
-        for (int i = 1; i < alarms.size(); ++i) {
+        for (int i = 1; i < alarms.size(); ++i)
             QVERIFY(std::make_pair(alarms[i]["ServerTime"], alarms[i]["AlarmID"]) <
                     std::make_pair(alarms[i - 1]["ServerTime"], alarms[i - 1]["AlarmID"]));
-        }
     }
 
     // The demo alarms: the same seed seeds the same alarms, which cover every event of the three
@@ -236,10 +215,9 @@ private slots:
     void seededAlarms()
     {
         QCOMPARE(query(*openServer(u":memory:"_s, 400), queryCommand()), m_all);
-        QSet<QString> events;
+        QSet<QStringList> events;
         for (const AlarmFields& alarm : std::as_const(m_all)) {
-            events.insert(alarm["EventClass"] + '/' + alarm["SubEventType"] + '/' +
-                          alarm["SubEvent"]);
+            events.insert({alarm["EventClass"], alarm["SubEventType"], alarm["SubEvent"]});
             const QList<AlarmFields> entries = info(*m_server, alarm["AlarmID"], u"Entry"_s);
             QVERIFY(!entries.isEmpty());
             QCOMPARE(entries.first(), (AlarmFields{{"Time", alarm["ServerTime"]},
@@ -279,9 +257,6 @@ private slots:
         QCOMPARE(info(*m_server, first, u"Alarm"_s).first()["State"], u"Handled"_s);
         QCOMPARE(info(*m_server, first, u"Entry"_s).last()["Note"], u"second look"_s);
 
-        const CommandReply unknown =
-            m_server->execute(u"GetAlarmInfo"_s, infoCommand(u"A9999999"_s));
-        QCOMPARE(unknown.statusText + unknown.replyText, u"80000004"_s);
         m_all = query(*m_server, queryCommand());
     }
 
@@ -314,11 +289,9 @@ private slots:
             attributes += u" a%1=''"_s.arg(i);
         const auto row = [](const char* name, const char* method, const QString& command,
                             const char* status = "80000001") {
-            QTest::newRow(name) << QString::fromLatin1(method) << command
-                                << QString::fromLatin1(status);
+            QTest::newRow(name) << method << command << status;
         };
         row("not XML", "QryAlarmList", u"<QryAlarmList><Filters>"_s);
-        row("empty", "GetAlarmInfo", QString());
         row("root of another command", "GetAlarmInfo",
             u"<MuteAlarm><Mute>false</Mute></MuteAlarm>"_s);
         row("DTD", "GetAlarmInfo",
@@ -366,18 +339,16 @@ private slots:
         QAtomicInt failures;
         std::vector<std::unique_ptr<QThread>> threads;
         for (int t = 0; t < 4; ++t) {
-            threads
-                .emplace_back(QThread::create([&server, &failures, t] {
-                    for (int i = 1 + t * 10; i <= 10 + t * 10; ++i) {
-                        const QString id = u"A%1"_s.arg(i, 7, 10, QChar('0'));
-                        failures += !server
-                                         ->execute(u"ProcessAlarm"_s,
-                                                   processCommand({id}, u"Processing"_s, u"done"_s))
-                                         .replyText.contains("<Code>0</Code>"_L1) ||
-                                    query(*server, queryCommand()).size() != 200;
-                    }
-                }))
-                ->start();
+            threads.emplace_back(QThread::create([&server, &failures, t] {
+                for (int i = 1 + t * 10; i <= 10 + t * 10; ++i) {
+                    const QString command = processCommand({u"A%1"_s.arg(i, 7, 10, QChar('0'))},
+                                                           u"Processing"_s, u"done"_s);
+                    const CommandReply reply = server->execute(u"ProcessAlarm"_s, command);
+                    failures += !reply.replyText.contains("<Code>0</Code>"_L1) ||
+                                query(*server, queryCommand()).size() != 200;
+                }
+            }));
+            threads.back()->start();
         }
         for (auto& thread : threads)
             QVERIFY(thread->wait());
@@ -403,15 +374,14 @@ private slots:
         const QByteArray second = encodeFrame({{"id", 2}});
         QByteArray huge(4, '\0');
         qToBigEndian(kMaxFramePayload + 1, huge.data());
-        QByteArray array(4, '\0');
-        qToBigEndian(quint32(2), array.data());
+        const QByteArray twoBytes = encodeFrame({}).left(4); // the header of "{}"
         QTest::newRow("two frames at once") << first + second << 2 << 0 << true;
-        QTest::newRow("frame and a half") << first + second.left(7) << 1 << 7 << true;
+        QTest::newRow("frame and all but a byte")
+            << first + second.chopped(1) << 1 << second.size() - 1 << true;
         QTest::newRow("header only") << first.left(3) << 0 << 3 << true;
-        QTest::newRow("all but one byte") << first.chopped(1) << 0 << first.size() - 1 << true;
         QTest::newRow("too long") << first + huge << 1 << 4 << false;
-        QTest::newRow("not an object") << array + "[]" << 0 << 6 << false;
-        QTest::newRow("not JSON") << first + encodeFrame({}).left(4) + "{x" << 1 << 6 << false;
+        QTest::newRow("not an object") << twoBytes + "[]" << 0 << 6 << false;
+        QTest::newRow("not JSON") << first + twoBytes + "{x" << 1 << 6 << false;
     }
 
     void framing()
@@ -443,8 +413,7 @@ private slots:
         socket.connectToHost(QHostAddress::LocalHost, tcp.serverPort());
         QVERIFY(socket.waitForConnected(5000));
         const QString padded = "<GetAlarmInfo>" + QString(20000, u' ') + "</GetAlarmInfo>";
-        const int queries = 200;
-        const int requests = queries + 2000;
+        const int queries = 200, requests = queries + 2000;
         for (int id = 0; id < requests; ++id) {
             socket.write(encodeFrame({{"id", id},
                                       {"method", id < queries ? "QryAlarmList" : "GetAlarmInfo"},
