@@ -55,10 +55,11 @@ export function watchErrors(browser, allow, secrets = []) {
 }
 
 export async function signIn(page, url, token) {
-  await page.goto(`${url}/`);
+  const response = await page.goto(`${url}/`);
   await page.getByLabel('Access token').fill(token);
   await page.keyboard.press('Enter');
   await page.locator('#live-status.on').waitFor();
+  return response;
 }
 
 export const rowIds = (page) => page.$$eval('#alarms tbody tr', (rs) => rs.map((r) => r.dataset.id));
